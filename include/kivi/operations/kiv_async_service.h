@@ -1,0 +1,108 @@
+// Services: the objects through which a host component runs its operations.
+// Each owns one operation queue, held through OperationQueueProtocol so that a
+// host can put a double in its place.
+//
+//   KivAsyncServiceObjC     observable; the one-argument constructor gives a
+//                           serial queue (limit 1)
+//   KivAsyncService         plain; the caller always chooses the limit
+//   KivAtomicWorkflowService  serial; runs one atomic workflow at a time
+//
+// An atomic workflow begins when the host hands its first operation to
+// startAtomicWorkflowWithOperation() and lasts until the host calls
+// endAtomicWorkflow(), typically from the completion of the workflow's last
+// operation. Starts that arrive meanwhile are parked in arrival order and
+// released one per endAtomicWorkflow():
+//
+//   auto service = std::make_shared<kivi::KivAtomicWorkflowService>("sync");
+//   op->setCompletionBlock([weak = std::weak_ptr(service)] {
+//     if (auto s = weak.lock()) s->endAtomicWorkflow();
+//   });
+//   service->startAtomicWorkflowWithOperation(op);
+//
+// Thread contract: the workflow operations may be called from any thread; all
+// four hold atomicWorkFlowLock (a recursive lock) for their whole length,
+// including the call into the queue and the whole enumeration. An enumeration
+// callback may call back into the service on the same thread but must not
+// park or release operations. The field accessors take no lock; replacing the
+// queue, the lock or the list while other threads use the service is not
+// synchronised.
+#pragma once
+
+#include <cstdint>
+#include <deque>
+#include <functional>
+#include <memory>
+#include <string>
+
+#include "kivi/foundation/object.h"
+#include "kivi/foundation/operation.h"
+#include "kivi/foundation/recursive_lock.h"
+#include "kivi/operations/operation_queue_protocol.h"
+
+namespace kivi {
+
+class KivAsyncServiceObjC : public Object {
+ public:
+  // A queue named `name` with a concurrency limit of 1.
+  explicit KivAsyncServiceObjC(std::string operationQueueName);
+  // A new kivi::OperationQueue; then its name, then its limit, passed through
+  // unchanged.
+  KivAsyncServiceObjC(std::string operationQueueName, std::int64_t maxConcurrentOperationCount);
+
+  virtual std::shared_ptr<OperationQueueProtocol> operationQueue() const;
+  virtual void setOperationQueue(std::shared_ptr<OperationQueueProtocol> operationQueue);
+
+ private:
+  std::shared_ptr<OperationQueueProtocol> operationQueue_;
+};
+
+class KivAsyncService {
+ public:
+  KivAsyncService(std::string operationQueueName, std::int64_t maxConcurrentOperationCount);
+  virtual ~KivAsyncService() = default;
+
+  virtual std::shared_ptr<OperationQueueProtocol> operationQueue() const;
+  virtual void setOperationQueue(std::shared_ptr<OperationQueueProtocol> operationQueue);
+
+ private:
+  std::shared_ptr<OperationQueueProtocol> operationQueue_;
+};
+
+using PendingOperationList = std::deque<OperationPtr>;
+
+class KivAtomicWorkflowService : public KivAsyncServiceObjC {
+ public:
+  // Always serial: the queue's limit is 1. This is the service's only
+  // constructor, so every service has its lock and its pending list.
+  explicit KivAtomicWorkflowService(std::string operationQueueName);
+
+  // Idle: hands `operation` to the queue and becomes Busy. Busy: parks it.
+  // A null operation is refused; nothing changes.
+  void startAtomicWorkflowWithOperation(const OperationPtr& operation);
+  // Becomes Idle, then releases the oldest parked operation, if any (which
+  // makes the service Busy again).
+  void endAtomicWorkflow();
+  // Cancels every parked operation, oldest first; they stay parked.
+  void cancelAllPendingOperations();
+  // Calls `block` with each parked operation and its index, oldest first,
+  // until it sets *stop to true.
+  void enumeratePendingOperationsUsingBlock(
+      const std::function<void(const OperationPtr& operation, std::uint64_t index, bool* stop)>&
+          block);
+
+  virtual bool isAtomicWorkflowInProgress() const;
+  virtual void setIsAtomicWorkflowInProgress(bool inProgress);
+  virtual std::shared_ptr<RecursiveLock> atomicWorkFlowLock() const;
+  // A null lock is refused.
+  virtual void setAtomicWorkFlowLock(std::shared_ptr<RecursiveLock> lock);
+  virtual std::shared_ptr<PendingOperationList> pendingOperations() const;
+  // A null list is refused.
+  virtual void setPendingOperations(std::shared_ptr<PendingOperationList> pendingOperations);
+
+ private:
+  std::atomic<bool> isAtomicWorkflowInProgress_{false};
+  std::shared_ptr<RecursiveLock> atomicWorkFlowLock_;
+  std::shared_ptr<PendingOperationList> pendingOperations_;
+};
+
+}  // namespace kivi

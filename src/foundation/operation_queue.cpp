@@ -1,0 +1,265 @@
+#include "kivi/foundation/operation_queue.h"
+
+#include <algorithm>
+
+#include "kivi/foundation/worker_pool.h"
+#include "queue_core.h"
+
+namespace kivi {
+
+namespace detail {
+
+namespace {
+// The queue whose drain job runs on this thread, and the operation it is
+// starting.
+thread_local const QueueCore* tDrainCore = nullptr;
+thread_local const Operation* tDrainOperation = nullptr;
+}  // namespace
+
+std::int64_t QueueCore::limitLocked() const {
+  return maxCount < 0 ? OperationQueue::kDefaultConcurrency : maxCount;
+}
+
+bool QueueCore::add(const OperationPtr& operation) {
+  if (!operation || operation->isFinished()) return false;
+  {
+    std::lock_guard lock(operation->mutex_);
+    if (operation->enqueued_) return false;
+    operation->enqueued_ = true;
+  }
+  const std::uint64_t epoch = ++operation->readyEpoch_;
+  const bool ready = operation->isReady();
+  std::size_t drainers = 0;
+  {
+    std::lock_guard lock(mutex);
+    auto& slot = operation->slot_;
+    slot.listed = true;
+    slot.sequence = nextSequence++;
+    slot.position = pending.insert(pending.end(), operation);
+    slot.ready = ready;
+    slot.readyEpoch = epoch;
+    if (ready) ++readyPending;
+    if (!keepAlive) keepAlive = shared_from_this();
+    drainers = drainersNeededLocked(false);
+  }
+  {
+    std::lock_guard lock(operation->mutex_);
+    operation->queue_ = weak_from_this();
+  }
+  launchDrainers(drainers);
+  // Announcements made before the operation knew its queue did not reach us.
+  if (operation->finishHandled_) {
+    operationFinished(*operation);
+  } else if (operation->readyEpoch_.load() != epoch) {
+    readinessChanged(*operation);
+  }
+  return true;
+}
+
+void QueueCore::readinessChanged(Operation& operation) {
+  const std::uint64_t epoch = ++operation.readyEpoch_;
+  const bool ready = operation.isReady();
+  std::size_t drainers = 0;
+  {
+    std::lock_guard lock(mutex);
+    auto& slot = operation.slot_;
+    if (!slot.listed || slot.started || epoch <= slot.readyEpoch) return;
+    slot.readyEpoch = epoch;
+    if (slot.ready == ready) return;
+    slot.ready = ready;
+    ready ? ++readyPending : --readyPending;
+    drainers = drainersNeededLocked(false);
+  }
+  launchDrainers(drainers);
+}
+
+void QueueCore::operationFinished(Operation& operation) {
+  OperationPtr held;                  // released after the lock
+  std::shared_ptr<QueueCore> keeper;  // likewise
+  std::size_t drainers = 0;
+  {
+    std::lock_guard lock(mutex);
+    auto& slot = operation.slot_;
+    if (!slot.listed || slot.done) return;
+    slot.done = true;
+    slot.listed = false;
+    held = std::move(*slot.position);
+    if (slot.started) {
+      running.erase(slot.position);
+    } else {
+      pending.erase(slot.position);
+      if (slot.ready) --readyPending;
+    }
+    const bool own = tDrainCore == this && tDrainOperation == &operation;
+    drainers = drainersNeededLocked(own);
+    if (pending.empty() && running.empty()) keeper = std::move(keepAlive);
+    if (waiters) left.notify_all();
+  }
+  launchDrainers(drainers);
+}
+
+std::size_t QueueCore::drainersNeededLocked(bool ownOperationFinishing) {
+  if (suspended) return 0;
+  const auto limit = static_cast<std::size_t>(limitLocked());
+  const std::size_t returning = ownOperationFinishing ? 1 : 0;
+  std::size_t count = 0;
+  while (searching < readyPending && running.size() + searching + returning < limit) {
+    ++searching;
+    ++count;
+  }
+  return count;
+}
+
+void QueueCore::launchDrainers(std::size_t count) {
+  for (std::size_t i = 0; i < count; ++i) {
+    WorkerPool::shared().submit([core = shared_from_this()] { core->drain(); });
+  }
+}
+
+void QueueCore::drain() {
+  tDrainCore = this;
+  std::unique_lock lock(mutex);
+  for (;;) {
+    OperationPtr operation;
+    if (!suspended && running.size() < static_cast<std::size_t>(limitLocked())) {
+      auto it = std::find_if(pending.begin(), pending.end(),
+                             [](const OperationPtr& op) { return op->slot_.ready; });
+      if (it != pending.end()) operation = *it;
+    }
+    --searching;
+    if (!operation) break;
+    --readyPending;
+    auto& slot = operation->slot_;
+    running.splice(running.end(), pending, slot.position);
+    slot.started = true;
+    operation->queueStarted_.store(true, std::memory_order_release);
+    lock.unlock();
+    tDrainOperation = operation.get();
+    operation->start();
+    tDrainOperation = nullptr;
+    operation.reset();
+    lock.lock();
+    ++searching;
+  }
+  tDrainCore = nullptr;
+}
+
+std::vector<OperationPtr> QueueCore::operationsLocked() const {
+  std::vector<OperationPtr> all;
+  all.reserve(pending.size() + running.size());
+  all.insert(all.end(), running.begin(), running.end());
+  all.insert(all.end(), pending.begin(), pending.end());
+  std::sort(all.begin(), all.end(), [](const OperationPtr& a, const OperationPtr& b) {
+    return a->slot_.sequence < b->slot_.sequence;
+  });
+  return all;
+}
+
+bool QueueCore::allDoneLocked(const std::vector<OperationPtr>& operations) {
+  return std::all_of(operations.begin(), operations.end(),
+                     [](const OperationPtr& op) { return op->slot_.done; });
+}
+
+}  // namespace detail
+
+OperationQueue::OperationQueue() : core_(std::make_shared<detail::QueueCore>()) {}
+
+OperationQueue::~OperationQueue() = default;
+
+void OperationQueue::addOperation(const OperationPtr& operation) { core_->add(operation); }
+
+void OperationQueue::addOperations(const std::vector<OperationPtr>& operations,
+                                   bool waitUntilFinished) {
+  std::vector<OperationPtr> added;
+  for (const auto& operation : operations) {
+    if (core_->add(operation)) added.push_back(operation);
+  }
+  if (!waitUntilFinished || added.empty()) return;
+  std::unique_lock lock(core_->mutex);
+  ++core_->waiters;
+  core_->left.wait(lock, [&] { return detail::QueueCore::allDoneLocked(added); });
+  --core_->waiters;
+}
+
+void OperationQueue::addOperationWithBlock(std::function<void()> block) {
+  addOperation(std::make_shared<BlockOperation>(std::move(block)));
+}
+
+void OperationQueue::cancelAllOperations() {
+  for (const auto& operation : operations()) operation->cancel();
+}
+
+void OperationQueue::waitUntilAllOperationsAreFinished() {
+  std::unique_lock lock(core_->mutex);
+  ++core_->waiters;
+  core_->left.wait(lock, [&] { return core_->pending.empty() && core_->running.empty(); });
+  --core_->waiters;
+}
+
+std::int64_t OperationQueue::maxConcurrentOperationCount() const {
+  std::lock_guard lock(core_->mutex);
+  return core_->maxCount;
+}
+
+void OperationQueue::setMaxConcurrentOperationCount(std::int64_t count) {
+  willChangeValueForKey("maxConcurrentOperationCount");
+  std::size_t drainers = 0;
+  {
+    std::lock_guard lock(core_->mutex);
+    core_->maxCount = count;
+    drainers = core_->drainersNeededLocked(false);
+  }
+  core_->launchDrainers(drainers);
+  didChangeValueForKey("maxConcurrentOperationCount");
+}
+
+std::string OperationQueue::name() const {
+  std::lock_guard lock(core_->mutex);
+  return core_->name;
+}
+
+void OperationQueue::setName(std::string name) {
+  willChangeValueForKey("name");
+  {
+    std::lock_guard lock(core_->mutex);
+    core_->name = std::move(name);
+  }
+  didChangeValueForKey("name");
+}
+
+std::vector<OperationPtr> OperationQueue::operations() const {
+  std::lock_guard lock(core_->mutex);
+  return core_->operationsLocked();
+}
+
+std::uint64_t OperationQueue::operationCount() const {
+  std::lock_guard lock(core_->mutex);
+  return core_->pending.size() + core_->running.size();
+}
+
+bool OperationQueue::isSuspended() const {
+  std::lock_guard lock(core_->mutex);
+  return core_->suspended;
+}
+
+void OperationQueue::setSuspended(bool suspended) {
+  willChangeValueForKey("isSuspended");
+  std::size_t drainers = 0;
+  {
+    std::lock_guard lock(core_->mutex);
+    core_->suspended = suspended;
+    drainers = core_->drainersNeededLocked(false);
+  }
+  core_->launchDrainers(drainers);
+  didChangeValueForKey("isSuspended");
+}
+
+Value OperationQueue::valueForKey(std::string_view key) const {
+  if (key == "name") return Value(name());
+  if (key == "maxConcurrentOperationCount") return Value(maxConcurrentOperationCount());
+  if (key == "operationCount") return Value(operationCount());
+  if (key == "isSuspended") return Value(isSuspended());
+  return Object::valueForKey(key);
+}
+
+}  // namespace kivi

@@ -1,0 +1,227 @@
+#include "kivi/foundation/value.h"
+
+#include <cmath>
+#include <cstdio>
+#include <cstdlib>
+#include <limits>
+
+#include "kivi/foundation/object.h"
+
+namespace kivi {
+
+bool Number::boolValue() const noexcept {
+  switch (type_) {
+    case Type::Double:
+      return d_ != 0;
+    default:
+      return i_ != 0;
+  }
+}
+
+std::int64_t Number::longLongValue() const noexcept {
+  switch (type_) {
+    case Type::UInt:
+      return u_ > static_cast<std::uint64_t>(std::numeric_limits<std::int64_t>::max())
+                 ? std::numeric_limits<std::int64_t>::max()
+                 : static_cast<std::int64_t>(u_);
+    case Type::Double:
+      if (std::isnan(d_)) return 0;
+      if (d_ >= 9223372036854775808.0) return std::numeric_limits<std::int64_t>::max();
+      if (d_ < -9223372036854775808.0) return std::numeric_limits<std::int64_t>::min();
+      return static_cast<std::int64_t>(d_);
+    default:
+      return i_;
+  }
+}
+
+std::uint64_t Number::unsignedLongLongValue() const noexcept {
+  switch (type_) {
+    case Type::UInt:
+      return u_;
+    case Type::Double:
+      if (std::isnan(d_) || d_ <= -1.0) return static_cast<std::uint64_t>(longLongValue());
+      if (d_ >= 18446744073709551616.0) return std::numeric_limits<std::uint64_t>::max();
+      return static_cast<std::uint64_t>(d_);
+    default:
+      return static_cast<std::uint64_t>(i_);  // two's complement, as the platform
+  }
+}
+
+double Number::doubleValue() const noexcept {
+  switch (type_) {
+    case Type::UInt:
+      return static_cast<double>(u_);
+    case Type::Double:
+      return d_;
+    default:
+      return static_cast<double>(i_);
+  }
+}
+
+std::string Number::stringValue() const {
+  switch (type_) {
+    case Type::UInt:
+      return std::to_string(u_);
+    case Type::Double: {
+      char buf[32];
+      std::snprintf(buf, sizeof buf, "%.17g", d_);
+      // Prefer the shortest text that reads back the same.
+      for (int precision = 1; precision < 17; ++precision) {
+        char shorter[32];
+        std::snprintf(shorter, sizeof shorter, "%.*g", precision, d_);
+        if (std::strtod(shorter, nullptr) == d_) return shorter;
+      }
+      return buf;
+    }
+    default:
+      return std::to_string(i_);
+  }
+}
+
+bool operator==(const Number& a, const Number& b) noexcept {
+  using T = Number::Type;
+  if (a.type_ != T::Double && b.type_ != T::Double) {
+    const bool aNegative = a.type_ != T::UInt && a.i_ < 0;
+    const bool bNegative = b.type_ != T::UInt && b.i_ < 0;
+    return aNegative == bNegative && a.u_ == b.u_;
+  }
+  if (a.type_ == T::Double && b.type_ == T::Double) return a.d_ == b.d_;
+  const Number& d = a.type_ == T::Double ? a : b;
+  const Number& i = a.type_ == T::Double ? b : a;
+  if (std::trunc(d.d_) != d.d_) return false;
+  if (i.type_ == T::UInt)
+    return d.d_ >= 0 && d.d_ < 18446744073709551616.0 && static_cast<std::uint64_t>(d.d_) == i.u_;
+  return d.d_ >= -9223372036854775808.0 && d.d_ < 9223372036854775808.0 &&
+         static_cast<std::int64_t>(d.d_) == i.i_;
+}
+
+Value::Value(Array a) : v_(std::make_shared<const Array>(std::move(a))) {}
+Value::Value(Dictionary d) : v_(std::make_shared<const Dictionary>(std::move(d))) {}
+Value::Value(std::shared_ptr<Object> o) noexcept {
+  if (o) v_ = std::move(o);
+}
+
+const Array* Value::asArray() const noexcept {
+  auto* p = std::get_if<std::shared_ptr<const Array>>(&v_);
+  return p ? p->get() : nullptr;
+}
+
+const Dictionary* Value::asDictionary() const noexcept {
+  auto* p = std::get_if<std::shared_ptr<const Dictionary>>(&v_);
+  return p ? p->get() : nullptr;
+}
+
+const Value* Value::find(std::string_view key) const noexcept {
+  const Dictionary* d = asDictionary();
+  if (!d) return nullptr;
+  auto it = d->find(key);
+  return it == d->end() ? nullptr : &it->second;
+}
+
+const Value* Value::at(std::size_t index) const noexcept {
+  const Array* a = asArray();
+  return a && index < a->size() ? &(*a)[index] : nullptr;
+}
+
+bool operator==(const Value& a, const Value& b) noexcept {
+  if (a.kind() != b.kind()) return false;
+  switch (a.kind()) {
+    case Value::Kind::Null:
+      return true;
+    case Value::Kind::Number:
+      return *a.asNumber() == *b.asNumber();
+    case Value::Kind::String:
+      return *a.asString() == *b.asString();
+    case Value::Kind::Data:
+      return *a.asData() == *b.asData();
+    case Value::Kind::Date:
+      return *a.asDate() == *b.asDate();
+    case Value::Kind::Array:
+      return a.asArray() == b.asArray() || *a.asArray() == *b.asArray();
+    case Value::Kind::Dictionary:
+      return a.asDictionary() == b.asDictionary() || *a.asDictionary() == *b.asDictionary();
+    case Value::Kind::Object:
+      return *a.asObject() == *b.asObject();
+  }
+  return false;
+}
+
+namespace {
+
+void appendQuoted(std::string& out, const std::string& s) {
+  out += '"';
+  for (char c : s) {
+    if (c == '"' || c == '\\') out += '\\';
+    out += c;
+  }
+  out += '"';
+}
+
+void describe(const Value& v, std::string& out) {
+  switch (v.kind()) {
+    case Value::Kind::Null:
+      out += "<null>";
+      return;
+    case Value::Kind::Number:
+      out += v.asNumber()->stringValue();
+      return;
+    case Value::Kind::String:
+      appendQuoted(out, *v.asString());
+      return;
+    case Value::Kind::Data: {
+      static const char* hex = "0123456789abcdef";
+      out += '<';
+      const Data& d = *v.asData();
+      for (std::size_t i = 0; i < d.size(); ++i) {
+        if (i && i % 4 == 0) out += ' ';
+        out += hex[d[i] >> 4];
+        out += hex[d[i] & 15];
+      }
+      out += '>';
+      return;
+    }
+    case Value::Kind::Date: {
+      char buf[48];
+      std::snprintf(buf, sizeof buf, "<date %.3f>", v.asDate()->timeIntervalSince1970);
+      out += buf;
+      return;
+    }
+    case Value::Kind::Array: {
+      out += '(';
+      bool first = true;
+      for (const Value& e : *v.asArray()) {
+        out += first ? "" : ", ";
+        first = false;
+        describe(e, out);
+      }
+      out += ')';
+      return;
+    }
+    case Value::Kind::Dictionary: {
+      out += '{';
+      bool first = true;
+      for (const auto& [k, e] : *v.asDictionary()) {
+        out += first ? "" : "; ";
+        first = false;
+        appendQuoted(out, k);
+        out += " = ";
+        describe(e, out);
+      }
+      out += '}';
+      return;
+    }
+    case Value::Kind::Object:
+      out += (*v.asObject())->description();
+      return;
+  }
+}
+
+}  // namespace
+
+std::string Value::description() const {
+  std::string out;
+  describe(*this, out);
+  return out;
+}
+
+}  // namespace kivi

@@ -1,0 +1,81 @@
+#include "kivi/foundation/worker_pool.h"
+
+#include <algorithm>
+#include <chrono>
+#include <condition_variable>
+#include <deque>
+#include <mutex>
+#include <thread>
+
+namespace kivi {
+
+namespace {
+thread_local bool tIsWorker = false;
+constexpr auto kIdleTimeout = std::chrono::seconds(5);
+}  // namespace
+
+struct WorkerPool::State {
+  std::mutex mutex;
+  std::condition_variable wake;
+  std::deque<std::function<void()>> jobs;  // guarded by mutex
+  std::size_t threads = 0;                 // guarded by mutex
+  std::size_t idle = 0;                    // guarded by mutex
+  std::size_t wakeups = 0;                 // guarded by mutex: notified, not yet awake
+  std::size_t keep = 0;                    // threads that never time out
+
+  void run() {
+    tIsWorker = true;
+    std::unique_lock lock(mutex);
+    for (;;) {
+      while (jobs.empty()) {
+        ++idle;
+        const bool woke = wake.wait_for(lock, kIdleTimeout, [&] { return !jobs.empty(); });
+        --idle;
+        if (wakeups) --wakeups;
+        if (!woke && threads > keep) {
+          --threads;
+          return;
+        }
+      }
+      auto job = std::move(jobs.front());
+      jobs.pop_front();
+      lock.unlock();
+      job();
+      job = nullptr;  // release captures outside the lock
+      lock.lock();
+    }
+  }
+};
+
+WorkerPool::WorkerPool() : state_(new State) {
+  state_->keep = std::max(2u, std::thread::hardware_concurrency());
+}
+
+WorkerPool& WorkerPool::shared() {
+  // Never destroyed: workers may still be waiting when the process exits.
+  static WorkerPool* pool = new WorkerPool;
+  return *pool;
+}
+
+bool WorkerPool::isWorkerThread() noexcept { return tIsWorker; }
+
+void WorkerPool::submit(std::function<void()> job) {
+  State& s = *state_;
+  bool spawn = false;
+  {
+    std::lock_guard lock(s.mutex);
+    s.jobs.push_back(std::move(job));
+    // Wake an idle worker for each job that no woken worker will take; make a
+    // new thread when none is idle.
+    if (s.idle > s.wakeups) {
+      ++s.wakeups;
+      s.wake.notify_one();
+    } else if (s.threads < kMaxThreads) {
+      ++s.threads;
+      spawn = true;
+    }
+  }
+  if (spawn) std::thread([&s] { s.run(); }).detach();
+}
+
+}  // namespace kivi

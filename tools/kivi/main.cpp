@@ -1,0 +1,64 @@
+// kivi: the sample command-line host of the library.
+#include <iostream>
+#include <string>
+#include <vector>
+
+#include "command.h"
+#include "kivi/version.h"
+
+namespace kivi::tool {
+
+std::vector<Command> allCommands() { return {demoCommand()}; }
+
+bool wantsHelp(const std::vector<std::string>& args) {
+  for (const auto& a : args) {
+    if (a == "-h" || a == "--help") return true;
+  }
+  return false;
+}
+
+namespace {
+
+void printHelp(std::ostream& out) {
+  out << "usage: kivi <command> [arguments]\n\n"
+         "The sample host of the KiviOSSDK library "
+      << KiviOSSDKVersionString
+      << ".\n\n"
+         "Commands:\n";
+  for (const auto& command : allCommands()) {
+    out << "  " << command.name
+        << std::string(command.name.size() < 12 ? 12 - command.name.size() : 1, ' ')
+        << command.summary << "\n";
+  }
+  out << "\nRun 'kivi <command> --help' for a command's own options.\n";
+}
+
+}  // namespace
+
+int main(int argc, char** argv) {
+  std::vector<std::string> args(argv + 1, argv + argc);
+  if (args.empty() || args[0] == "-h" || args[0] == "--help" || args[0] == "help") {
+    printHelp(args.empty() ? std::cerr : std::cout);
+    return args.empty() ? 2 : 0;
+  }
+  if (args[0] == "--version") {
+    std::cout << KiviOSSDKVersionString << "\n";
+    return 0;
+  }
+  for (const auto& command : allCommands()) {
+    if (command.name != args[0]) continue;
+    std::vector<std::string> rest(args.begin() + 1, args.end());
+    if (wantsHelp(rest)) {
+      std::cout << command.usage;
+      return 0;
+    }
+    return command.run(rest, std::cout, std::cerr);
+  }
+  std::cerr << "kivi: unknown command '" << args[0] << "'\n\n";
+  printHelp(std::cerr);
+  return 2;
+}
+
+}  // namespace kivi::tool
+
+int main(int argc, char** argv) { return kivi::tool::main(argc, argv); }
