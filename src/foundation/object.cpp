@@ -96,7 +96,9 @@ std::string Object::className() const {
 std::string Object::description() const {
   char address[32];
   std::snprintf(address, sizeof address, "%p", static_cast<const void*>(this));
-  return "<" + className() + ": " + address + ">";
+  std::string text = "<";
+  text.append(className()).append(": ").append(address).append(">");
+  return text;
 }
 
 Value Object::valueForKey(std::string_view) const { return Value(); }
@@ -140,10 +142,13 @@ void Object::willChangeValueForKey(std::string_view key) {
 }
 
 void Object::didChangeValueForKey(std::string_view key) {
-  ObservationInfo* info = observationInfo();
-  if (info && info->count.load(std::memory_order_acquire) != 0) {
-    // Pair with the latest will-change of this object and key on this thread.
-    std::optional<Value> oldValue;
+  // An observer may drop the last reference to this object while it is told;
+  // stay alive until keyValueDidChange has run too.
+  std::shared_ptr<Object> self;
+  // Pair with the latest will-change of this object and key on this thread,
+  // even when its observers have left since.
+  std::optional<Value> oldValue;
+  if (!tPendingChanges.empty()) {
     for (auto it = tPendingChanges.rbegin(); it != tPendingChanges.rend(); ++it) {
       if (it->object == this && it->key == key) {
         oldValue = std::move(it->oldValue);
@@ -151,9 +156,12 @@ void Object::didChangeValueForKey(std::string_view key) {
         break;
       }
     }
+  }
+  ObservationInfo* info = observationInfo();
+  if (info && info->count.load(std::memory_order_acquire) != 0) {
+    self = weak_from_this().lock();
     auto observations = info->snapshot(key);
     if (!observations.empty()) {
-      auto self = weak_from_this().lock();
       const bool wantsNew =
           std::any_of(observations.begin(), observations.end(),
                       [](const auto& o) { return (o->options & KeyValueObservingOptionNew) != 0; });

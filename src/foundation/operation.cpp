@@ -68,6 +68,7 @@ bool Operation::isAsynchronous() const { return false; }
 
 bool Operation::isReady() const {
   if (isCancelled()) return true;
+  if (dependencyCount_.load(std::memory_order_acquire) == 0) return true;
   std::vector<OperationPtr> dependencies;
   {
     std::lock_guard lock(mutex_);
@@ -91,6 +92,7 @@ void Operation::addDependency(const OperationPtr& operation) {
   {
     std::lock_guard lock(mutex_);
     dependencies_.push_back(operation);
+    dependencyCount_.store(dependencies_.size(), std::memory_order_release);
   }
   if (self) {
     std::lock_guard lock(operation->mutex_);
@@ -106,6 +108,7 @@ void Operation::removeDependency(const OperationPtr& operation) {
   {
     std::lock_guard lock(mutex_);
     std::erase(dependencies_, operation);
+    dependencyCount_.store(dependencies_.size(), std::memory_order_release);
   }
   {
     std::lock_guard lock(operation->mutex_);

@@ -1,6 +1,7 @@
 #include "kivi/foundation/operation_queue.h"
 
 #include <algorithm>
+#include <utility>
 
 #include "kivi/foundation/worker_pool.h"
 #include "queue_core.h"
@@ -14,6 +15,8 @@ namespace {
 // starting.
 thread_local const QueueCore* tDrainCore = nullptr;
 thread_local const Operation* tDrainOperation = nullptr;
+// Set when that operation finished inside its start().
+thread_local bool tDrainOperationFinished = false;
 }  // namespace
 
 std::int64_t QueueCore::limitLocked() const {
@@ -22,11 +25,7 @@ std::int64_t QueueCore::limitLocked() const {
 
 bool QueueCore::add(const OperationPtr& operation) {
   if (!operation || operation->isFinished()) return false;
-  {
-    std::lock_guard lock(operation->mutex_);
-    if (operation->enqueued_) return false;
-    operation->enqueued_ = true;
-  }
+  if (operation->enqueued_.exchange(true)) return false;
   const std::uint64_t epoch = ++operation->readyEpoch_;
   const bool ready = operation->isReady();
   std::size_t drainers = 0;
@@ -35,12 +34,13 @@ bool QueueCore::add(const OperationPtr& operation) {
     auto& slot = operation->slot_;
     slot.listed = true;
     slot.sequence = nextSequence++;
-    slot.position = pending.insert(pending.end(), operation);
+    slot.held = operation;
+    pending.pushBack(operation.get());
     slot.ready = ready;
     slot.readyEpoch = epoch;
     if (ready) ++readyPending;
     if (!keepAlive) keepAlive = shared_from_this();
-    drainers = drainersNeededLocked(false);
+    drainers = drainersNeededLocked();
   }
   {
     std::lock_guard lock(operation->mutex_);
@@ -68,42 +68,51 @@ void QueueCore::readinessChanged(Operation& operation) {
     if (slot.ready == ready) return;
     slot.ready = ready;
     ready ? ++readyPending : --readyPending;
-    drainers = drainersNeededLocked(false);
+    drainers = drainersNeededLocked();
   }
   launchDrainers(drainers);
 }
 
 void QueueCore::operationFinished(Operation& operation) {
-  OperationPtr held;                  // released after the lock
-  std::shared_ptr<QueueCore> keeper;  // likewise
+  if (tDrainCore == this && tDrainOperation == &operation) {
+    // Finished inside the start() that a drain job of ours is running: the
+    // job takes it out of the queue as soon as start() returns, in the same
+    // locked section in which it looks for the next operation.
+    tDrainOperationFinished = true;
+    return;
+  }
+  Retired retired;
   std::size_t drainers = 0;
   {
     std::lock_guard lock(mutex);
-    auto& slot = operation.slot_;
-    if (!slot.listed || slot.done) return;
-    slot.done = true;
-    slot.listed = false;
-    held = std::move(*slot.position);
-    if (slot.started) {
-      running.erase(slot.position);
-    } else {
-      pending.erase(slot.position);
-      if (slot.ready) --readyPending;
-    }
-    const bool own = tDrainCore == this && tDrainOperation == &operation;
-    drainers = drainersNeededLocked(own);
-    if (pending.empty() && running.empty()) keeper = std::move(keepAlive);
-    if (waiters) left.notify_all();
+    drainers = retireLocked(operation, retired);
   }
   launchDrainers(drainers);
 }
 
-std::size_t QueueCore::drainersNeededLocked(bool ownOperationFinishing) {
+std::size_t QueueCore::retireLocked(Operation& operation, Retired& retired) {
+  auto& slot = operation.slot_;
+  if (!slot.listed || slot.done) return 0;
+  slot.done = true;
+  slot.listed = false;
+  retired.held = std::move(slot.held);
+  if (slot.started) {
+    running.remove(&operation);
+  } else {
+    pending.remove(&operation);
+    if (slot.ready) --readyPending;
+  }
+  const bool empty = pending.empty() && running.empty();
+  if (empty) retired.keeper = std::move(keepAlive);
+  if (batchWaiters || (emptyWaiters && empty)) left.notify_all();
+  return drainersNeededLocked();
+}
+
+std::size_t QueueCore::drainersNeededLocked() {
   if (suspended) return 0;
   const auto limit = static_cast<std::size_t>(limitLocked());
-  const std::size_t returning = ownOperationFinishing ? 1 : 0;
   std::size_t count = 0;
-  while (searching < readyPending && running.size() + searching + returning < limit) {
+  while (searching < readyPending && running.size() + searching < limit) {
     ++searching;
     ++count;
   }
@@ -118,37 +127,50 @@ void QueueCore::launchDrainers(std::size_t count) {
 
 void QueueCore::drain() {
   tDrainCore = this;
+  Retired retired;          // references to drop once the lock is released
+  std::size_t drainers = 0; // likewise, drain jobs to launch
   std::unique_lock lock(mutex);
   for (;;) {
     OperationPtr operation;
     if (!suspended && running.size() < static_cast<std::size_t>(limitLocked())) {
-      auto it = std::find_if(pending.begin(), pending.end(),
-                             [](const OperationPtr& op) { return op->slot_.ready; });
-      if (it != pending.end()) operation = *it;
+      for (Operation* op = pending.front(); op; op = SlotList::next(op)) {
+        if (op->slot_.ready) {
+          operation = op->slot_.held;
+          break;
+        }
+      }
     }
     --searching;
     if (!operation) break;
     --readyPending;
     auto& slot = operation->slot_;
-    running.splice(running.end(), pending, slot.position);
+    pending.remove(operation.get());
+    running.pushBack(operation.get());
     slot.started = true;
     operation->queueStarted_.store(true, std::memory_order_release);
     lock.unlock();
+    retired = {};
+    launchDrainers(std::exchange(drainers, 0));
     tDrainOperation = operation.get();
+    tDrainOperationFinished = false;
     operation->start();
     tDrainOperation = nullptr;
-    operation.reset();
     lock.lock();
     ++searching;
+    if (tDrainOperationFinished) drainers = retireLocked(*operation, retired);
+    retired.operation = std::move(operation);
   }
+  lock.unlock();
   tDrainCore = nullptr;
+  launchDrainers(drainers);
 }
 
 std::vector<OperationPtr> QueueCore::operationsLocked() const {
   std::vector<OperationPtr> all;
   all.reserve(pending.size() + running.size());
-  all.insert(all.end(), running.begin(), running.end());
-  all.insert(all.end(), pending.begin(), pending.end());
+  for (const SlotList* list : {&running, &pending}) {
+    for (Operation* op = list->front(); op; op = SlotList::next(op)) all.push_back(op->slot_.held);
+  }
   std::sort(all.begin(), all.end(), [](const OperationPtr& a, const OperationPtr& b) {
     return a->slot_.sequence < b->slot_.sequence;
   });
@@ -176,9 +198,9 @@ void OperationQueue::addOperations(const std::vector<OperationPtr>& operations,
   }
   if (!waitUntilFinished || added.empty()) return;
   std::unique_lock lock(core_->mutex);
-  ++core_->waiters;
+  ++core_->batchWaiters;
   core_->left.wait(lock, [&] { return detail::QueueCore::allDoneLocked(added); });
-  --core_->waiters;
+  --core_->batchWaiters;
 }
 
 void OperationQueue::addOperationWithBlock(std::function<void()> block) {
@@ -191,9 +213,9 @@ void OperationQueue::cancelAllOperations() {
 
 void OperationQueue::waitUntilAllOperationsAreFinished() {
   std::unique_lock lock(core_->mutex);
-  ++core_->waiters;
+  ++core_->emptyWaiters;
   core_->left.wait(lock, [&] { return core_->pending.empty() && core_->running.empty(); });
-  --core_->waiters;
+  --core_->emptyWaiters;
 }
 
 std::int64_t OperationQueue::maxConcurrentOperationCount() const {
@@ -207,7 +229,7 @@ void OperationQueue::setMaxConcurrentOperationCount(std::int64_t count) {
   {
     std::lock_guard lock(core_->mutex);
     core_->maxCount = count;
-    drainers = core_->drainersNeededLocked(false);
+    drainers = core_->drainersNeededLocked();
   }
   core_->launchDrainers(drainers);
   didChangeValueForKey("maxConcurrentOperationCount");
@@ -248,7 +270,7 @@ void OperationQueue::setSuspended(bool suspended) {
   {
     std::lock_guard lock(core_->mutex);
     core_->suspended = suspended;
-    drainers = core_->drainersNeededLocked(false);
+    drainers = core_->drainersNeededLocked();
   }
   core_->launchDrainers(drainers);
   didChangeValueForKey("isSuspended");

@@ -20,7 +20,6 @@ struct WorkerPool::State {
   std::deque<std::function<void()>> jobs;  // guarded by mutex
   std::size_t threads = 0;                 // guarded by mutex
   std::size_t idle = 0;                    // guarded by mutex
-  std::size_t wakeups = 0;                 // guarded by mutex: notified, not yet awake
   std::size_t keep = 0;                    // threads that never time out
 
   void run() {
@@ -31,7 +30,6 @@ struct WorkerPool::State {
         ++idle;
         const bool woke = wake.wait_for(lock, kIdleTimeout, [&] { return !jobs.empty(); });
         --idle;
-        if (wakeups) --wakeups;
         if (!woke && threads > keep) {
           --threads;
           return;
@@ -65,10 +63,9 @@ void WorkerPool::submit(std::function<void()> job) {
   {
     std::lock_guard lock(s.mutex);
     s.jobs.push_back(std::move(job));
-    // Wake an idle worker for each job that no woken worker will take; make a
-    // new thread when none is idle.
-    if (s.idle > s.wakeups) {
-      ++s.wakeups;
+    // Wake an idle worker while there are at least as many idle workers as
+    // queued jobs; otherwise make a new thread.
+    if (s.jobs.size() <= s.idle) {
       s.wake.notify_one();
     } else if (s.threads < kMaxThreads) {
       ++s.threads;

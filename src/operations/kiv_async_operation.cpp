@@ -71,6 +71,13 @@ std::optional<KivAsyncOperation::State> KivAsyncOperation::stateFromRawValue(
   return std::nullopt;
 }
 
+std::string_view KivAsyncOperation::keyPath(State state) noexcept {
+  // "is" followed by the raw value; spelled out once so that announcing a
+  // transition builds no strings.
+  static constexpr std::string_view kKeys[] = {"isReady", "isExecuting", "isFinished"};
+  return kKeys[static_cast<std::size_t>(state)];
+}
+
 ErrorPtr KivAsyncOperation::completionError() const { return completionError_; }
 void KivAsyncOperation::setCompletionError(ErrorPtr error) { completionError_ = std::move(error); }
 KivAsyncOperation::State KivAsyncOperation::state() const { return state_; }

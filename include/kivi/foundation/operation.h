@@ -30,7 +30,6 @@
 #include <atomic>
 #include <cstdint>
 #include <functional>
-#include <list>
 #include <memory>
 #include <mutex>
 #include <string>
@@ -42,7 +41,8 @@ namespace kivi {
 
 namespace detail {
 struct QueueCore;
-}
+class SlotList;
+}  // namespace detail
 
 class Operation;
 using OperationPtr = std::shared_ptr<Operation>;
@@ -95,6 +95,7 @@ class Operation : public Object {
 
  private:
   friend struct detail::QueueCore;
+  friend class detail::SlotList;
 
   void didFinish();
   std::shared_ptr<detail::QueueCore> queueCore() const;
@@ -105,7 +106,6 @@ class Operation : public Object {
   std::function<void()> completionBlock_;             // guarded by mutex_
   std::string name_;                                  // guarded by mutex_
   std::weak_ptr<detail::QueueCore> queue_;            // guarded by mutex_; set once
-  bool enqueued_ = false;                             // guarded by mutex_
 
   std::atomic<bool> cancelled_{false};
   std::atomic<bool> baseStarted_{false};
@@ -114,6 +114,8 @@ class Operation : public Object {
   std::atomic<bool> finishHandled_{false};
   std::atomic<bool> cancelAnnounced_{false};
   std::atomic<bool> queueStarted_{false};
+  std::atomic<bool> enqueued_{false};
+  std::atomic<std::size_t> dependencyCount_{0};  // dependencies_.size()
 
   // The queue's bookkeeping, guarded by the owning QueueCore's mutex.
   struct QueueSlot {
@@ -123,7 +125,9 @@ class Operation : public Object {
     bool ready = false;    // last readiness the queue read
     std::uint64_t readyEpoch = 0;
     std::uint64_t sequence = 0;
-    std::list<OperationPtr>::iterator position;
+    OperationPtr held;              // the queue's reference while listed
+    Operation* previous = nullptr;  // links of the pending or running list
+    Operation* next = nullptr;
   } slot_;
   std::atomic<std::uint64_t> readyEpoch_{0};
 };

@@ -15,8 +15,12 @@
 //
 //   class Fetch : public kivi::KivAsyncOperation {
 //     void start() override {
-//       if (isCancelled()) { setCompletionError(cancelledError()); coreCompleteOperation(); return;
-//       } moveToExecutingState(); client.fetch([weak = weak_from_this()](auto result) {
+//       if (isCancelled()) {
+//         coreCompleteOperation();
+//         return;
+//       }
+//       moveToExecutingState();
+//       client.fetch([weak = weak_from_this()](auto result) {
 //         auto self = std::static_pointer_cast<Fetch>(weak.lock());
 //         if (!self) return;
 //         self->setCompletionError(result.error);
@@ -108,7 +112,8 @@ class KivAsyncOperation : public Operation {
   Value valueForKey(std::string_view key) const override;
 
  private:
-  static std::string keyPath(State state) { return "is" + std::string(rawValue(state)); }
+  // "is" + rawValue(state).
+  static std::string_view keyPath(State state) noexcept;
   void changeState(State newState);
 
   ErrorPtr completionError_;
