@@ -1,0 +1,61 @@
+#!/usr/bin/env bash
+# Makes sure the Debian packages the build needs are installed.
+#
+# Prints nothing and returns 0 when they all are. Otherwise, as root, installs
+# the missing ones with apt-get; as any other user, prints the apt-get line to
+# run and exits 1.
+set -euo pipefail
+
+# Everything the build, the tests, the benchmarks and the fuzzers need.
+#   libclang-rt-14-dev: libFuzzer and the sanitizer runtimes for clang.
+PACKAGES=(
+  cmake
+  ninja-build
+  g++
+  clang
+  libclang-rt-14-dev
+  libgtest-dev
+  libgmock-dev
+  googletest
+  libbenchmark-dev
+  pkg-config
+  libicu-dev
+  libssl-dev
+  libcurl4-openssl-dev
+  libsimdjson-dev
+  nlohmann-json3-dev
+  libcpp-httplib-dev
+)
+
+# Prints the packages among the arguments that are not installed.
+missing_packages() {
+  local -A ok=()
+  local package status
+  # One dpkg-query for all; it names the unknown packages on stderr.
+  while read -r package status; do
+    if [[ $status == "install ok installed" ]]; then ok[$package]=1; fi
+  done < <(dpkg-query -W -f='${Package} ${Status}\n' "$@" 2>/dev/null || true)
+  for package; do
+    if [[ -z ${ok[$package]:-} ]]; then echo "$package"; fi
+  done
+}
+
+mapfile -t missing < <(missing_packages "${PACKAGES[@]}")
+((${#missing[@]} == 0)) && exit 0
+
+if ((EUID != 0)); then
+  echo "deps.sh: missing Debian packages: ${missing[*]}" >&2
+  echo "Install them with:" >&2
+  echo "sudo apt-get install -y --no-install-recommends ${missing[*]}" >&2
+  exit 1
+fi
+
+echo "deps.sh: installing ${missing[*]}" >&2
+apt-get update
+DEBIAN_FRONTEND=noninteractive apt-get install -y --no-install-recommends "${missing[@]}"
+
+mapfile -t still_missing < <(missing_packages "${missing[@]}")
+if ((${#still_missing[@]} > 0)); then
+  echo "deps.sh: still not installed: ${still_missing[*]}" >&2
+  exit 1
+fi
