@@ -12,44 +12,48 @@
 #include <thread>
 #include <vector>
 
-#include "foundation/kvo_recorder.h"
 #include "test_support.h"
 
 namespace kivi {
 namespace {
 
 using std::chrono::milliseconds;
-using testing::Latch;
-using testing::waitFor;
+using testing::kQuiet;
+using testing::Signal;
 using QueuePtr = std::shared_ptr<OperationQueue>;
-
-constexpr milliseconds kQuiet{50};  // how long "nothing happens" is watched
 
 std::shared_ptr<BlockOperation> blockOp(std::function<void()> block) {
   return std::make_shared<BlockOperation>(std::move(block));
+}
+
+void expectDrains(const QueuePtr& queue) {
+  ASSERT_TRUE(testing::returnsWithin([queue] { queue->waitUntilAllOperationsAreFinished(); }));
+  EXPECT_EQ(queue->operationCount(), 0u);
+  EXPECT_TRUE(queue->operations().empty());
 }
 
 // Operations that each hold their slot until limit - 1 later ones have started,
 // then watch briefly for one more: a queue over its limit shows as a higher peak.
 class ConcurrencyProbe {
  public:
-  ConcurrencyProbe(int limit, int total) : limit_(limit), total_(total), done(total) {}
+  ConcurrencyProbe(int limit, int total) : limit_(limit), total_(total) {}
   void enter() {
     std::unique_lock lock(mutex_);
     const int order = ++started_;
     peak_ = std::max(peak_, ++running_);
     cv_.notify_all();
     const int partners = std::min(order + limit_ - 1, total_);
-    if (!cv_.wait_for(lock, std::chrono::seconds(10), [&] { return started_ >= partners; })) {
+    if (!cv_.wait_for(lock, testing::kTimeout, [&] { return started_ >= partners; }))
       timedOut_ = true;
-    }
     if (order + limit_ <= total_)
       cv_.wait_for(lock, milliseconds(5), [&] { return started_ > partners; });
     --running_;
     lock.unlock();
-    done.countDown();
+    done_.notify();
   }
+  // The most operations seen running at once, once all have run.
   int peak() {
+    EXPECT_TRUE(done_.wait(total_));
     std::lock_guard lock(mutex_);
     EXPECT_FALSE(timedOut_);
     return peak_;
@@ -61,45 +65,8 @@ class ConcurrencyProbe {
   const int limit_, total_;
   int started_ = 0, running_ = 0, peak_ = 0;
   bool timedOut_ = false;
-
- public:
-  Latch done;
+  Signal done_;
 };
-
-// Starts, then finishes (or pretends to) only when told.
-class ManualAsyncOperation : public Operation {
- public:
-  bool isAsynchronous() const override { return true; }
-  bool isExecuting() const override { return executing_; }
-  bool isFinished() const override { return finished_; }
-  void start() override {
-    willChangeValueForKey("isExecuting");
-    executing_ = true;
-    didChangeValueForKey("isExecuting");
-    started.countDown();
-  }
-  void finish() {
-    willChangeValueForKey("isExecuting");
-    willChangeValueForKey("isFinished");
-    executing_ = false;
-    finished_ = true;
-    didChangeValueForKey("isExecuting");
-    didChangeValueForKey("isFinished");
-  }
-  void announceFinished() {
-    willChangeValueForKey("isFinished");
-    didChangeValueForKey("isFinished");
-  }
-  Latch started;
-
- private:
-  std::atomic<bool> executing_{false}, finished_{false};
-};
-
-void expectDrains(const QueuePtr& queue) {
-  EXPECT_TRUE(waitFor([&] { return queue->operationCount() == 0; }));
-  EXPECT_TRUE(queue->operations().empty());
-}
 
 TEST(OperationQueue, NeverExceedsMaxConcurrentOperationCount) {
   for (int limit : {1, 2, 3}) {
@@ -111,124 +78,86 @@ TEST(OperationQueue, NeverExceedsMaxConcurrentOperationCount) {
     std::vector<OperationPtr> ops;
     for (int i = 0; i < kTotal; ++i) ops.push_back(blockOp([probe] { probe->enter(); }));
     queue->addOperations(ops, false);
-    ASSERT_TRUE(probe->done.wait());
     EXPECT_EQ(probe->peak(), limit);
     expectDrains(queue);
   }
 }
 
+// Held-back operations start once released, even when nothing else holds the
+// queue any more: a busy queue keeps itself alive.
 TEST(OperationQueue, ZeroLimitAndSuspensionHoldOperationsBack) {
-  const struct {
-    const char* name;
-    std::function<void(OperationQueue&)> hold, release;
-  } cases[] = {
-      {"zero limit", [](auto& q) { q.setMaxConcurrentOperationCount(0); },
-       [](auto& q) { q.setMaxConcurrentOperationCount(2); }},
-      {"suspended", [](auto& q) { q.setSuspended(true); }, [](auto& q) { q.setSuspended(false); }}};
-  for (const auto& c : cases) {
-    SCOPED_TRACE(c.name);
+  for (bool suspend : {false, true}) {
+    SCOPED_TRACE(suspend ? "suspended" : "zero limit");
     auto queue = std::make_shared<OperationQueue>();
-    c.hold(*queue);
-    auto ran = std::make_shared<Latch>(3);
-    for (int i = 0; i < 3; ++i) queue->addOperationWithBlock([ran] { ran->countDown(); });
-    EXPECT_FALSE(ran->wait(kQuiet));
+    suspend ? queue->setSuspended(true) : queue->setMaxConcurrentOperationCount(0);
+    auto ran = std::make_shared<Signal>();
+    for (int i = 0; i < 3; ++i) queue->addOperationWithBlock([ran] { ran->notify(); });
+    EXPECT_FALSE(ran->wait(1, kQuiet));
     EXPECT_EQ(queue->operationCount(), 3u);
-    c.release(*queue);
-    EXPECT_TRUE(ran->wait());
-    EXPECT_FALSE(queue->isSuspended());
-    expectDrains(queue);
+    suspend ? queue->setSuspended(false) : queue->setMaxConcurrentOperationCount(2);
+    queue.reset();
+    EXPECT_TRUE(ran->wait(3));
   }
 }
 
-TEST(OperationQueue, SerialQueueRunsInAdditionOrderAndListsItsOperations) {
-  auto queue = std::make_shared<OperationQueue>();
+// A serial queue runs what it accepted in addition order; it refuses null,
+// duplicate, already queued and finished operations.
+TEST(OperationQueue, SerialQueueRunsAcceptedOperationsInAdditionOrder) {
+  auto queue = std::make_shared<OperationQueue>(), other = std::make_shared<OperationQueue>();
   queue->setMaxConcurrentOperationCount(1);
   queue->setSuspended(true);
   auto order = std::make_shared<std::vector<int>>();  // serial: no lock needed
-  auto done = std::make_shared<Latch>(20);
+  auto finished = blockOp([] {});
+  finished->start();
   std::vector<OperationPtr> ops;
-  std::vector<int> expected;
   for (int i = 0; i < 20; ++i) {
-    expected.push_back(i);
-    ops.push_back(blockOp([order, done, i] {
-      order->push_back(i);
-      done->countDown();
-    }));
+    ops.push_back(blockOp([order, i] { order->push_back(i); }));
     queue->addOperation(ops.back());
   }
+  queue->addOperation(nullptr);
+  queue->addOperation(ops[0]);
+  other->addOperation(ops[1]);
+  queue->addOperations({ops[2], nullptr, finished}, false);
   EXPECT_EQ(queue->operations(), ops);
   EXPECT_EQ(queue->operationCount(), 20u);
-  queue->setSuspended(false);
-  ASSERT_TRUE(done->wait());
-  EXPECT_EQ(*order, expected);
-  expectDrains(queue);
-}
-
-TEST(OperationQueue, DependencyOnAnOperationOfAnotherQueue) {
-  auto first = std::make_shared<OperationQueue>(), second = std::make_shared<OperationQueue>();
-  auto gate = std::make_shared<Latch>(), ran = std::make_shared<Latch>();
-  auto before = blockOp([gate] { gate->wait(); });
-  std::weak_ptr<Operation> weakBefore = before;
-  auto sawFinished = std::make_shared<std::atomic<bool>>(false);
-  auto after = blockOp([=] {
-    *sawFinished = weakBefore.lock()->isFinished();
-    ran->countDown();
-  });
-  after->addDependency(before);
-  second->addOperation(after);
-  first->addOperation(before);
-  EXPECT_FALSE(ran->wait(kQuiet));
-  gate->countDown();
-  ASSERT_TRUE(ran->wait());
-  EXPECT_TRUE(*sawFinished);
-}
-
-TEST(OperationQueue, AddOperationsCanWaitForThemAll) {
-  auto queue = std::make_shared<OperationQueue>();
-  auto gate = std::make_shared<Latch>(), returned = std::make_shared<Latch>();
-  std::vector<OperationPtr> ops{blockOp([gate] { gate->wait(); })};
-  for (int i = 0; i < 7; ++i) ops.push_back(blockOp([] {}));
-  std::thread caller([=] {
-    queue->addOperations(ops, true);
-    returned->countDown();
-  });
-  EXPECT_FALSE(returned->wait(kQuiet));
-  gate->countDown();
-  if (!returned->wait()) {
-    caller.detach();
-    FAIL() << "addOperations did not return";
-  }
-  caller.join();
-  for (const auto& op : ops) EXPECT_TRUE(op->isFinished());
-}
-
-TEST(OperationQueue, RefusesNullDuplicateAndFinishedOperations) {
-  auto queue = std::make_shared<OperationQueue>(), other = std::make_shared<OperationQueue>();
-  queue->setSuspended(true);
-  auto runs = std::make_shared<std::atomic<int>>(0);
-  auto op = blockOp([runs] { ++*runs; }), finished = blockOp([runs] { ++*runs; });
-  finished->start();
-  queue->addOperation(nullptr);
-  queue->addOperation(op);
-  queue->addOperation(op);
-  other->addOperation(op);
-  queue->addOperations({op, nullptr, finished}, false);
-  EXPECT_EQ(queue->operations(), std::vector<OperationPtr>{op});
   EXPECT_EQ(other->operationCount(), 0u);
   queue->setSuspended(false);
-  EXPECT_TRUE(waitFor([&] { return op->isFinished(); }));
   expectDrains(queue);
-  EXPECT_EQ(*runs, 2);
+  std::vector<int> expected(20);
+  for (int i = 0; i < 20; ++i) expected[i] = i;
+  EXPECT_EQ(*order, expected);
+}
+
+// addOperations(…, true) and an operation's waitUntilFinished() block until
+// the work is done; waiting on a finished operation returns at once.
+TEST(OperationQueue, BlockingWaitsReturnOnceTheWorkIsDone) {
+  auto queue = std::make_shared<OperationQueue>();
+  auto gate = std::make_shared<Signal>(), returned = std::make_shared<Signal>();
+  std::vector<OperationPtr> ops{blockOp([gate] { ASSERT_TRUE(gate->wait()); })};
+  for (int i = 0; i < 7; ++i) ops.push_back(blockOp([] {}));
+  std::thread([=] {
+    queue->addOperations(ops, true);
+    returned->notify();
+  }).detach();
+  std::thread([=] {
+    ops[0]->waitUntilFinished();
+    returned->notify();
+  }).detach();
+  EXPECT_FALSE(returned->wait(1, kQuiet));
+  gate->notify();
+  ASSERT_TRUE(returned->wait(2)) << "a wait did not return";
+  for (const auto& op : ops) EXPECT_TRUE(op->isFinished());
+  EXPECT_TRUE(testing::returnsWithin([op = ops[0]] { op->waitUntilFinished(); }));
 }
 
 TEST(OperationQueue, CancelAllOperations) {
   auto queue = std::make_shared<OperationQueue>();
   queue->setMaxConcurrentOperationCount(1);
-  auto started = std::make_shared<Latch>(), gate = std::make_shared<Latch>();
+  auto started = std::make_shared<Signal>(), gate = std::make_shared<Signal>();
   auto runs = std::make_shared<std::atomic<int>>(0);
   auto running = blockOp([=] {
-    started->countDown();
-    gate->wait();
+    started->notify();
+    ASSERT_TRUE(gate->wait());
   });
   queue->addOperation(running);
   ASSERT_TRUE(started->wait());
@@ -238,70 +167,27 @@ TEST(OperationQueue, CancelAllOperations) {
   queue->addOperations(pending, false);
   queue->cancelAllOperations();
   EXPECT_TRUE(running->isCancelled());
-  gate->countDown();
+  gate->notify();
   expectDrains(queue);
   for (const auto& op : pending) EXPECT_TRUE(op->isCancelled() && op->isFinished());
   EXPECT_EQ(*runs, 0);
 }
 
-TEST(OperationQueue, ReleasedQueueStillRunsItsOperations) {
-  auto gate = std::make_shared<Latch>(), ran = std::make_shared<Latch>(5);
-  auto queue = std::make_shared<OperationQueue>();
-  queue->setMaxConcurrentOperationCount(1);
-  queue->addOperationWithBlock([=] {
-    gate->wait();
-    ran->countDown();
-  });
-  for (int i = 0; i < 4; ++i) queue->addOperationWithBlock([ran] { ran->countDown(); });
-  queue.reset();
-  gate->countDown();
-  EXPECT_TRUE(ran->wait());
-}
-
-TEST(OperationQueue, AsynchronousOperationHoldsItsSlotUntilReallyFinished) {
-  auto queue = std::make_shared<OperationQueue>();
-  queue->setMaxConcurrentOperationCount(1);
-  auto async = std::make_shared<ManualAsyncOperation>();
-  auto completions = std::make_shared<std::atomic<int>>(0);
-  async->setCompletionBlock([completions] { ++*completions; });
-  auto nextRan = std::make_shared<Latch>();
-  queue->addOperation(async);
-  queue->addOperationWithBlock([nextRan] { nextRan->countDown(); });
-  ASSERT_TRUE(async->started.wait());
-  EXPECT_FALSE(nextRan->wait(kQuiet));  // start() returned, the slot is still taken
-  async->announceFinished();            // isFinished() still reads false
-  EXPECT_FALSE(nextRan->wait(kQuiet));
-  EXPECT_EQ(queue->operationCount(), 2u);
-  std::thread([async] { async->finish(); }).join();
-  EXPECT_TRUE(nextRan->wait());
-  async->announceFinished();  // a second, late announcement must not free another slot
-
-  auto probe = std::make_shared<ConcurrencyProbe>(1, 6);
-  for (int i = 0; i < 6; ++i) queue->addOperationWithBlock([probe] { probe->enter(); });
-  ASSERT_TRUE(probe->done.wait());
-  EXPECT_EQ(probe->peak(), 1);
-  expectDrains(queue);
-  EXPECT_TRUE(waitFor([&] { return *completions == 1; }));
-}
-
+// Observed through the protocol, as services do.
 TEST(OperationQueue, NameAndLimitAreObservable) {
   auto queue = std::make_shared<OperationQueue>();
   OperationQueueProtocol& protocol = *queue;
-  auto recorder = std::make_shared<testing::Recorder>();
-  protocol.addObserver(recorder, "name", KeyValueObservingOptionNew, nullptr);
-  protocol.addObserver(recorder, "maxConcurrentOperationCount", KeyValueObservingOptionNew,
-                       nullptr);
   EXPECT_EQ(protocol.maxConcurrentOperationCount(),
             OperationQueueDefaultMaxConcurrentOperationCount);
+  auto recorder = std::make_shared<testing::Recorder>();
+  for (const char* key : {"name", "maxConcurrentOperationCount"})
+    protocol.addObserver(recorder, key, KeyValueObservingOptionNew, nullptr);
   protocol.setName("uploads");
   protocol.setMaxConcurrentOperationCount(2);
-  EXPECT_EQ(recorder->newValues("name"), std::vector<Value>{"uploads"});
-  EXPECT_EQ(recorder->newValues("maxConcurrentOperationCount"), std::vector<Value>{2});
-  EXPECT_EQ(queue->valueForKey("name"), Value("uploads"));
   protocol.removeObserver(recorder.get(), "name");
   protocol.setName("downloads");
-  EXPECT_EQ(recorder->count(), 2u);
-  EXPECT_EQ(protocol.name(), "downloads");
+  EXPECT_EQ(recorder->newValues("name"), std::vector<Value>{"uploads"});
+  EXPECT_EQ(recorder->newValues("maxConcurrentOperationCount"), std::vector<Value>{2});
 }
 
 }  // namespace

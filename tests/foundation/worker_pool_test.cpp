@@ -13,24 +13,23 @@
 namespace kivi {
 namespace {
 
-using testing::Latch;
+using testing::Signal;
 
 // Runs `jobs` jobs that each submit one more; all must run on workers.
 void runBurst(int jobs) {
   struct State {
-    explicit State(int total) : done(total) {}
     std::atomic<int> onWorker{0};
-    Latch done;
+    Signal done;
   };
-  auto state = std::make_shared<State>(2 * jobs);
+  auto state = std::make_shared<State>();
   for (int i = 0; i < jobs; ++i) {
     WorkerPool::shared().submit([state] {
       if (WorkerPool::isWorkerThread()) ++state->onWorker;
-      WorkerPool::shared().submit([state] { state->done.countDown(); });
-      state->done.countDown();
+      WorkerPool::shared().submit([state] { state->done.notify(); });
+      state->done.notify();
     });
   }
-  ASSERT_TRUE(state->done.wait());
+  ASSERT_TRUE(state->done.wait(2 * jobs));
   EXPECT_EQ(state->onWorker, jobs);
 }
 
@@ -43,20 +42,20 @@ TEST(WorkerPool, BlockedJobsDoNotHoldBackLaterOnes) {
   // More blocked jobs than cores, after a burst that leaves idle workers behind:
   // the last job needs an idle or a new worker promptly (an idle worker's
   // timeout is no substitute for a wake-up).
-  const std::size_t blockers =
-      std::min<std::size_t>(std::thread::hardware_concurrency() + 4, WorkerPool::kMaxThreads - 4);
+  const int blockers =
+      std::min<int>(std::thread::hardware_concurrency() + 4, WorkerPool::kMaxThreads - 4);
   for (int round = 0; round < 3 && !HasFailure(); ++round) {
     runBurst(500);
-    auto gate = std::make_shared<Latch>(), released = std::make_shared<Latch>(blockers);
-    for (std::size_t i = 0; i < blockers; ++i) {
+    auto gate = std::make_shared<Signal>(), released = std::make_shared<Signal>();
+    for (int i = 0; i < blockers; ++i) {
       WorkerPool::shared().submit([gate, released] {
-        gate->wait();
-        released->countDown();
+        EXPECT_TRUE(gate->wait());
+        released->notify();
       });
     }
-    WorkerPool::shared().submit([gate] { gate->countDown(); });
-    EXPECT_TRUE(gate->wait(std::chrono::seconds(2))) << "round " << round;
-    EXPECT_TRUE(released->wait());
+    WorkerPool::shared().submit([gate] { gate->notify(); });
+    EXPECT_TRUE(gate->wait(1, std::chrono::seconds(2))) << "round " << round;
+    EXPECT_TRUE(released->wait(blockers));
   }
 }
 

@@ -1,65 +1,54 @@
+// Both asynchronous operation variants, alone and run by a real kivi::OperationQueue.
 #include "kivi/operations/kiv_async_operation.h"
 
 #include <gtest/gtest.h>
 
+#include <chrono>
+#include <functional>
 #include <memory>
-#include <sstream>
+#include <optional>
 #include <string>
+#include <string_view>
+#include <thread>
 #include <vector>
 
 #include "kivi/foundation/error.h"
+#include "kivi/foundation/operation_queue.h"
 #include "operations/async_test_support.h"
 
 namespace kivi {
 namespace {
 
-using optest::Event;
-using optest::Recorder;
+using testing::Finish;
+using testing::FlagsProbe;
+using testing::kQuiet;
+using testing::Recorder;
+using testing::Signal;
+using QueuePtr = std::shared_ptr<OperationQueue>;
 using State = KivAsyncOperation::State;
+constexpr auto kPrior = KeyValueObservingOptionPrior;
 
-// "wR dF" → (will, isReady), (did, isFinished); R/E/F = isReady/isExecuting/isFinished.
-std::vector<Event> events(const std::string& script) {
-  std::vector<Event> out;
-  std::istringstream words(script);
-  for (std::string w; words >> w;)
-    out.emplace_back(w[0] == 'w' ? "will" : "did", w[1] == 'R'   ? "isReady"
-                                                   : w[1] == 'E' ? "isExecuting"
-                                                                 : "isFinished");
+// Recorded events as "wE dF …": will/did, then R/E/F for isReady/isExecuting/isFinished.
+std::string script(const std::vector<testing::Event>& events) {
+  std::string out;
+  for (const auto& [when, key] : events)
+    out += (out.empty() ? "" : " ") + when.substr(0, 1) + key[2];
   return out;
 }
-
-TEST(KivAsyncOperationVariants, StartReadyIdleAndAsynchronous) {
-  auto flags = std::make_shared<KivAsyncOperationObjC>();
-  EXPECT_TRUE(flags->readyState());
-  EXPECT_EQ(flags->completionError(), nullptr);
-  auto enumerated = std::make_shared<KivAsyncOperation>();
-  EXPECT_EQ(enumerated->state(), State::ready);
-  EXPECT_EQ(enumerated->completionError(), nullptr);
-  for (OperationPtr op : {OperationPtr(flags), OperationPtr(enumerated)}) {
-    SCOPED_TRACE(op->className());
-    EXPECT_TRUE(op->isReady());
-    EXPECT_FALSE(op->isExecuting());
-    EXPECT_FALSE(op->isFinished());
-    EXPECT_TRUE(op->isAsynchronous());
-  }
+std::function<void()> notifier(const std::shared_ptr<Signal>& signal) {
+  return [signal] { signal->notify(); };
 }
-
-TEST(KivAsyncOperationObjC, ReadyGateAnnouncesEverySetAndNarrowsDependencies) {
-  auto op = std::make_shared<KivAsyncOperationObjC>();
-  auto recorder = Recorder::watch(*op, {"isReady"});
-  for (bool gate : {false, false, true}) {  // the same value again is announced again
-    op->setReadyState(gate);
-    EXPECT_EQ(op->isReady(), gate);
-    EXPECT_EQ(recorder->take(), events("wR dR"));
-  }
-  auto dependency = std::make_shared<BlockOperation>([] {});
-  op->addDependency(dependency);
-  EXPECT_FALSE(op->isReady()) << "gate open, dependency unfinished";
-  dependency->start();
-  ASSERT_TRUE(dependency->isFinished());
-  EXPECT_TRUE(op->isReady());
-  op->setReadyState(false);
-  EXPECT_FALSE(op->isReady()) << "dependency finished, gate closed";
+OperationPtr notifying(const std::shared_ptr<Signal>& signal) {
+  return std::make_shared<BlockOperation>(notifier(signal));
+}
+QueuePtr serialQueue() {
+  auto queue = std::make_shared<OperationQueue>();
+  queue->setMaxConcurrentOperationCount(1);
+  return queue;
+}
+bool drains(const QueuePtr& queue) {
+  return testing::returnsWithin([queue] { queue->waitUntilAllOperationsAreFinished(); }) &&
+         queue->operationCount() == 0;
 }
 
 TEST(KivAsyncOperation, RawValuesRoundTripExactly) {
@@ -73,8 +62,10 @@ TEST(KivAsyncOperation, RawValuesRoundTripExactly) {
     EXPECT_EQ(KivAsyncOperation::stateFromRawValue(text), std::nullopt) << '"' << text << '"';
 }
 
-// What each path announces to an observer of the three state keys. `setup`
-// runs unrecorded, then `steps`; E = moveToExecutingState, C = coreCompleteOperation.
+// What each path announces to an observer of the three state keys, from a new
+// operation. `setup` runs unrecorded, then `steps`; E = moveToExecutingState,
+// C = coreCompleteOperation. Observers of "isFinished" already see the
+// completion error and a new value that matches the final state.
 TEST(AsyncOperationTransitions, AnnounceExactSequences) {
   struct Case {
     bool flags;
@@ -91,43 +82,153 @@ TEST(AsyncOperationTransitions, AnnounceExactSequences) {
       {false, "", "C", "wR wF dF dR", false, true},
       {false, "C", "C", "wF wF dF dF", false, true},  // completed twice
   };
+  const auto error = Error::create("Test", 7);
   for (const Case& c : cases) {
     SCOPED_TRACE(std::string(c.flags ? "ObjC " : "enum ") + c.setup + "|" + c.steps);
-    auto flags = std::make_shared<KivAsyncOperationObjC>();
-    auto enumerated = std::make_shared<KivAsyncOperation>();
-    OperationPtr op = c.flags ? OperationPtr(flags) : OperationPtr(enumerated);
-    auto step = [&](char s) {
-      if (c.flags) s == 'E' ? flags->moveToExecutingState() : flags->coreCompleteOperation();
-      if (!c.flags)
-        s == 'E' ? enumerated->moveToExecutingState() : enumerated->coreCompleteOperation();
+    auto run = [&](auto& op) {
+      EXPECT_TRUE(op.isReady() && !op.isExecuting() && !op.isFinished());
+      EXPECT_EQ(op.completionError(), nullptr);
+      auto step = [&op](char s) {
+        s == 'E' ? op.moveToExecutingState() : op.coreCompleteOperation();
+      };
+      for (const char* s = c.setup; *s; ++s) step(*s);
+      op.setCompletionError(error);
+      auto recorder = Recorder::watch(op, {"isReady", "isExecuting", "isFinished"},
+                                      kPrior | KeyValueObservingOptionNew);
+      recorder->onNote = [&](const testing::Note& note) {
+        if (note.prior || note.key != "isFinished") return;
+        EXPECT_EQ(op.completionError(), error);
+        EXPECT_EQ(note.change.at(KeyValueChangeNewKey), Value(c.finished));
+      };
+      for (const char* s = c.steps; *s; ++s) step(*s);
+      EXPECT_EQ(script(recorder->takeEvents()), c.expected);
+      EXPECT_EQ(op.isExecuting(), c.executing);
+      EXPECT_EQ(op.isFinished(), c.finished);
     };
-    for (const char* s = c.setup; *s; ++s) step(*s);
-    auto recorder = Recorder::watch(*op, {"isReady", "isExecuting", "isFinished"});
-    for (const char* s = c.steps; *s; ++s) step(*s);
-    EXPECT_EQ(recorder->take(), events(c.expected));
-    EXPECT_EQ(op->isExecuting(), c.executing);
-    EXPECT_EQ(op->isFinished(), c.finished);
+    c.flags ? run(*std::make_shared<KivAsyncOperationObjC>())
+            : run(*std::make_shared<KivAsyncOperation>());
   }
 }
 
-// An observer reacting to "isFinished" must already see the outcome, and the
-// announced new value must read finished.
-TEST(AsyncOperationTransitions, CompletionErrorIsVisibleToFinishedObservers) {
-  optest::forBothVariants([]<class Probe>() {
-    auto op = std::make_shared<Probe>();
-    auto error = Error::create("Test", 7);
-    op->moveToExecutingState();
-    auto recorder = Recorder::watch(*op, {"isFinished"}, KeyValueObservingOptionNew);
-    int didChanges = 0;
-    recorder->hook = [&](const Event&, Object* object, const Dictionary& change) {
-      ++didChanges;
-      EXPECT_EQ(dynamic_cast<Probe&>(*object).completionError(), error);
-      auto value = change.find(KeyValueChangeNewKey);
-      EXPECT_TRUE(value != change.end() && value->second == Value(true));
-    };
-    op->setCompletionError(error);
-    op->coreCompleteOperation();
-    EXPECT_EQ(didChanges, 1);
+// The gate announces every set, even of the same value, and narrows the
+// dependencies' readiness. A queued operation behind a closed gate waits while
+// later ones pass it, even on a serial queue.
+TEST(KivAsyncOperationObjC, ReadyGateHoldsTheOperationBack) {
+  auto queue = serialQueue();
+  auto gated = std::make_shared<FlagsProbe>(Finish::inlineOnce);
+  auto dependency = std::make_shared<BlockOperation>([] {});
+  auto done = std::make_shared<Signal>();
+  gated->setCompletionBlock(notifier(done));
+  auto recorder = Recorder::watch(*gated, {"isReady"}, kPrior);
+  for (bool gate : {true, false, false}) {
+    gated->setReadyState(gate);
+    EXPECT_EQ(gated->isReady(), gate);
+    EXPECT_EQ(script(recorder->takeEvents()), "wR dR");
+  }
+  gated->addDependency(dependency);
+  queue->addOperation(gated);
+  for (int i = 0; i < 3; ++i) queue->addOperation(notifying(done));
+  ASSERT_TRUE(done->wait(3));
+  gated->setReadyState(true);
+  EXPECT_FALSE(gated->isReady()) << "gate open, dependency unfinished";
+  gated->setReadyState(false);
+  dependency->start();
+  EXPECT_FALSE(gated->isReady()) << "dependency finished, gate closed";
+  EXPECT_FALSE(done->wait(4, kQuiet));
+  EXPECT_EQ(gated->starts, 0);
+  EXPECT_EQ(queue->operationCount(), 1u);
+  gated->setReadyState(true);
+  ASSERT_TRUE(done->wait(4));
+  EXPECT_EQ(gated->executions, 1);
+  EXPECT_TRUE(drains(queue));
+}
+
+// Finished inline or from another thread; cancelled before start with
+// Finish::manual: a probe that missed the cancellation would never finish.
+TEST(AsyncOperationInQueue, RunsToCompletionOrSkipsWorkWhenCancelled) {
+  const struct {
+    const char* name;
+    Finish finish;
+    bool cancelled;
+  } cases[] = {{"inline", Finish::inlineOnce, false},
+               {"on worker", Finish::onWorker, false},
+               {"cancelled", Finish::manual, true}};
+  for (const auto& c : cases) {
+    SCOPED_TRACE(c.name);
+    testing::forBothVariants([c]<class Probe>() {
+      auto queue = std::make_shared<OperationQueue>();
+      auto done = std::make_shared<Signal>();
+      auto op = std::make_shared<Probe>(c.finish);
+      op->setCompletionBlock(notifier(done));
+      if (c.cancelled) op->cancel();
+      queue->addOperation(op);
+      ASSERT_TRUE(done->wait());
+      EXPECT_EQ(op->starts, 1);
+      EXPECT_EQ(op->executions, c.cancelled ? 0 : 1);
+      EXPECT_TRUE(op->isFinished() && !op->isExecuting());
+      EXPECT_TRUE(drains(queue));
+    });
+  }
+}
+
+// a → b → c, spread over two wide queues: only the dependencies order them.
+TEST(AsyncOperationInQueue, DependenciesOrderStartsAcrossQueues) {
+  auto first = std::make_shared<OperationQueue>(), second = std::make_shared<OperationQueue>();
+  auto done = std::make_shared<Signal>();
+  auto checkDependencies = [](Operation& op) {
+    for (const auto& dependency : op.dependencies())
+      EXPECT_TRUE(dependency->isFinished()) << op.name() << " started early";
+  };
+  auto a = std::make_shared<FlagsProbe>(Finish::onWorker, "a", checkDependencies);
+  auto b = std::make_shared<testing::EnumProbe>(Finish::onWorker, "b", checkDependencies);
+  auto c = std::make_shared<FlagsProbe>(Finish::onWorker, "c", checkDependencies);
+  b->addDependency(a);
+  c->addDependency(b);
+  for (OperationPtr op : {OperationPtr(a), OperationPtr(b), OperationPtr(c)})
+    op->setCompletionBlock(notifier(done));
+  first->addOperations({c, a}, false);
+  second->addOperation(b);
+  ASSERT_TRUE(done->wait(3));
+  EXPECT_TRUE(drains(first) && drains(second));
+}
+
+// A serial queue counts an operation as executing until it announces
+// "isFinished" reading true. Announcing early, completing twice (inline or
+// late) or being started by hand while queued must neither free a second slot
+// nor wedge the queue.
+TEST(AsyncOperationInQueue, KeepsOneSlotPerOperationDespiteMisuse) {
+  testing::forBothVariants([]<class Probe>() {
+    auto queue = serialQueue();
+    auto held = std::make_shared<Probe>(Finish::manual);
+    auto byHand = std::make_shared<Probe>(Finish::inlineOnce);
+    auto twice = std::make_shared<Probe>(Finish::inlineTwice);
+    auto done = std::make_shared<Signal>(), next = std::make_shared<Signal>();
+    for (const auto& op : {held, byHand, twice}) op->setCompletionBlock(notifier(done));
+    queue->addOperation(held);
+    queue->addOperation(notifying(next));
+    ASSERT_TRUE(held->startReturned.wait());
+    held->willChangeValueForKey("isFinished");  // isFinished() still reads false
+    held->didChangeValueForKey("isFinished");
+    EXPECT_FALSE(next->wait(1, kQuiet)) << "the slot was freed before the operation finished";
+    EXPECT_EQ(queue->operationCount(), 2u);
+    std::thread([held] { held->coreCompleteOperation(); }).join();
+    ASSERT_TRUE(next->wait() && done->wait());
+    held->coreCompleteOperation();  // late
+
+    queue->setSuspended(true);
+    queue->addOperation(byHand);
+    byHand->start();
+    queue->addOperation(twice);
+    auto gate = std::make_shared<Signal>();
+    queue->addOperation(std::make_shared<BlockOperation>([gate] { ASSERT_TRUE(gate->wait()); }));
+    queue->addOperation(notifying(next));
+    queue->setSuspended(false);
+    EXPECT_FALSE(next->wait(2, kQuiet)) << "two operations ran at once";
+    gate->notify();
+    ASSERT_TRUE(next->wait(2)) << "the queue stopped starting operations";
+    EXPECT_EQ(twice->executions, 1);
+    EXPECT_TRUE(drains(queue));
+    EXPECT_FALSE(done->wait(4, std::chrono::milliseconds(0))) << "a completion block ran twice";
   });
 }
 

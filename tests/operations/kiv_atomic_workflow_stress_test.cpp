@@ -14,20 +14,21 @@
 namespace kivi {
 namespace {
 
+using testing::Finish;
+
 constexpr int kThreads = 8;
 constexpr int kWorkflowsPerThread = 1250;  // about 1 s under ThreadSanitizer on 2 cores
 constexpr int kWorkflows = kThreads * kWorkflowsPerThread;
 
 struct StressState {
   std::vector<std::atomic<int>> starts = std::vector<std::atomic<int>>(2 * kWorkflows);
-  std::atomic<int> active{0};
-  std::atomic<int> maxActive{0};
-  optest::Signal ended;
+  std::atomic<int> active{0}, maxActive{0};
+  testing::Signal ended;
 };
 
 // Workflows alternate variants and finishing threads.
 OperationPtr makeOp(const std::shared_ptr<StressState>& state, int id, bool first, int variety) {
-  auto onStart = [state, id, first](auto&) {
+  auto onStart = [state, id, first](Operation&) {
     state->starts[id].fetch_add(1);
     if (!first) return;
     const int now = state->active.fetch_add(1) + 1;
@@ -35,15 +36,9 @@ OperationPtr makeOp(const std::shared_ptr<StressState>& state, int id, bool firs
          now > seen && !state->maxActive.compare_exchange_weak(seen, now);) {
     }
   };
-  const auto finish = variety % 4 < 2 ? optest::Finish::onWorker : optest::Finish::inlineOnce;
-  if (variety % 2) {
-    auto op = std::make_shared<optest::FlagsProbe>(finish);
-    op->onStart = onStart;
-    return op;
-  }
-  auto op = std::make_shared<optest::EnumProbe>(finish);
-  op->onStart = onStart;
-  return op;
+  const auto finish = variety % 4 < 2 ? Finish::onWorker : Finish::inlineOnce;
+  if (variety % 2) return std::make_shared<testing::FlagsProbe>(finish, "", onStart);
+  return std::make_shared<testing::EnumProbe>(finish, "", onStart);
 }
 
 TEST(KivAtomicWorkflowServiceStress, ConcurrentWorkflowsRunOneAtATime) {
@@ -75,7 +70,7 @@ TEST(KivAtomicWorkflowServiceStress, ConcurrentWorkflowsRunOneAtATime) {
     });
   }
   for (auto& thread : threads) thread.join();
-  ASSERT_TRUE(state->ended.waitFor(kWorkflows, std::chrono::seconds(60)))
+  ASSERT_TRUE(state->ended.wait(kWorkflows, std::chrono::seconds(60)))
       << "workflows stalled; parked: " << service->pendingOperations()->size();
 
   EXPECT_EQ(state->maxActive.load(), 1) << "two workflows overlapped";
