@@ -6,6 +6,7 @@
 #include <limits>
 
 #include "kivi/foundation/object.h"
+#include "kivi/foundation/url.h"
 
 namespace kivi {
 
@@ -95,6 +96,9 @@ bool operator==(const Number& a, const Number& b) noexcept {
          static_cast<std::int64_t>(d.d_) == i.i_;
 }
 
+Value::Value(URLPtr url) noexcept {
+  if (url) v_ = std::move(url);
+}
 Value::Value(Array a) : v_(std::make_shared<const Array>(std::move(a))) {}
 Value::Value(Dictionary d) : v_(std::make_shared<const Dictionary>(std::move(d))) {}
 Value::Value(std::shared_ptr<Object> o) noexcept {
@@ -136,6 +140,8 @@ bool operator==(const Value& a, const Value& b) noexcept {
       return *a.asData() == *b.asData();
     case Value::Kind::Date:
       return *a.asDate() == *b.asDate();
+    case Value::Kind::URL:
+      return *a.asURL() == *b.asURL();
     case Value::Kind::Array:
       return a.asArray() == b.asArray() || *a.asArray() == *b.asArray();
     case Value::Kind::Dictionary:
@@ -186,6 +192,9 @@ void describe(const Value& v, std::string& out) {
       out += buf;
       return;
     }
+    case Value::Kind::URL:
+      out += v.asURL()->absoluteString();
+      return;
     case Value::Kind::Array: {
       out += '(';
       bool first = true;

@@ -9,6 +9,8 @@
 //   string        Value("text")                     (UTF-8)
 //   data          Value(Data{...})                  (raw bytes)
 //   date          Value(Date{seconds})              (seconds since 1970, UTC)
+//   URL           Value(URLPtr)                     (a null pointer gives the
+//                                                     null marker)
 //   array         Value(Array{...})
 //   dictionary    Value(Dictionary{{"key", ...}})   (string keys, sorted)
 //   object        Value(std::shared_ptr<Object>)    (any library object)
@@ -42,7 +44,10 @@
 namespace kivi {
 
 class Object;
+class URL;
 class Value;
+
+using URLPtr = std::shared_ptr<const URL>;
 
 // The platform's NSNull.
 struct Null {
@@ -97,7 +102,17 @@ class Number {
 
 class Value {
  public:
-  enum class Kind : std::uint8_t { Null, Number, String, Data, Date, Array, Dictionary, Object };
+  enum class Kind : std::uint8_t {
+    Null,
+    Number,
+    String,
+    Data,
+    Date,
+    URL,
+    Array,
+    Dictionary,
+    Object
+  };
 
   Value() noexcept = default;
   Value(std::nullptr_t) noexcept {}
@@ -116,13 +131,17 @@ class Value {
   Value(std::string_view s) : v_(std::string(s)) {}
   Value(Data d) noexcept : v_(std::move(d)) {}
   Value(Date d) noexcept : v_(d) {}
+  Value(URLPtr url) noexcept;
+  template <class T>
+  requires(std::is_convertible_v<std::shared_ptr<T>, URLPtr>) Value(std::shared_ptr<T> url)
+  noexcept : Value(URLPtr(std::move(url))) {}
   Value(Array a);
   Value(Dictionary d);
   Value(std::shared_ptr<Object> o) noexcept;
   template <class T>
   requires(!std::is_same_v<T, Object> &&
-           std::is_convertible_v<std::shared_ptr<T>, std::shared_ptr<Object>>)
-      Value(std::shared_ptr<T> o)
+           std::is_convertible_v<std::shared_ptr<T>, std::shared_ptr<Object>> &&
+           !std::is_convertible_v<std::shared_ptr<T>, URLPtr>) Value(std::shared_ptr<T> o)
   noexcept : Value(std::shared_ptr<Object>(std::move(o))) {}
 
   Kind kind() const noexcept { return static_cast<Kind>(v_.index()); }
@@ -133,6 +152,10 @@ class Value {
   const std::string* asString() const noexcept { return std::get_if<std::string>(&v_); }
   const Data* asData() const noexcept { return std::get_if<Data>(&v_); }
   const Date* asDate() const noexcept { return std::get_if<Date>(&v_); }
+  URLPtr asURL() const noexcept {
+    auto* p = std::get_if<URLPtr>(&v_);
+    return p ? *p : nullptr;
+  }
   const Array* asArray() const noexcept;
   const Dictionary* asDictionary() const noexcept;
   const std::shared_ptr<Object>* asObject() const noexcept {
@@ -149,15 +172,15 @@ class Value {
   const Value* find(std::string_view key) const noexcept;
   const Value* at(std::size_t index) const noexcept;
 
-  // Equality as the platform's isEqual: numbers by value, collections
-  // element-wise, objects by identity.
+  // Equality as the platform's isEqual: numbers by value, URLs by text,
+  // collections element-wise, objects by identity.
   friend bool operator==(const Value& a, const Value& b) noexcept;
 
   // A readable rendering for logs and diagnostics (not JSON).
   std::string description() const;
 
  private:
-  std::variant<Null, Number, std::string, Data, Date, std::shared_ptr<const Array>,
+  std::variant<Null, Number, std::string, Data, Date, URLPtr, std::shared_ptr<const Array>,
                std::shared_ptr<const Dictionary>, std::shared_ptr<Object>>
       v_;
 };

@@ -1,0 +1,87 @@
+// Small helpers around URLs, requests and cookies that clients of the
+// library's network layer keep needing:
+//
+//   KiviOSSdkUtils::addQueryItems    appends query items to URL components
+//   getQueryItemsDictionary          a query string as a name -> value map
+//   CustomHeaders::setHeaders        sets several header fields on a request
+//   KivURL                           a URL that refuses text needing encoding
+//   HTTPCookieUtils::filterCookies   the cookies belonging to some domains
+//
+//   auto components = *kivi::URLComponents::fromString("https://api.example.com/v1/items");
+//   kivi::KiviOSSdkUtils::addQueryItems(components, {{"page", "2"}, {"q", "a&b"}});
+//   components.string();   // "https://api.example.com/v1/items?page=2&q=a%26b"
+//
+//   kivi::getQueryItemsDictionary("a=1&b=&c");   // {"a": "1", "b": ""}
+//
+//   kivi::MutableURLRequest request(kivi::KivURL::initWithString("https://example.com/"));
+//   kivi::CustomHeaders::setHeaders(request, kivi::StringDictionary{{"Accept", "text/plain"}});
+//
+//   auto mine = kivi::HTTPCookieUtils::filterCookies(cookies, {"example.com"});
+//
+// Thread contract: all of these are pure functions of their arguments, safe to
+// call from any thread. addQueryItems and setHeaders change only the object
+// they are given, without synchronisation: that object must not be used by
+// another thread meanwhile.
+#pragma once
+
+#include <map>
+#include <memory>
+#include <optional>
+#include <string>
+#include <string_view>
+#include <vector>
+
+#include "kivi/foundation/http_cookie.h"
+#include "kivi/foundation/url.h"
+#include "kivi/foundation/url_components.h"
+#include "kivi/foundation/url_request.h"
+
+namespace kivi {
+
+namespace KiviOSSdkUtils {
+// Appends `items` to the query items of `components`, in order, keeping the
+// existing ones (names are never merged). An empty `items` changes nothing,
+// not even an empty query.
+void addQueryItems(URLComponents& components, const std::vector<URLQueryItem>& items);
+}  // namespace KiviOSSdkUtils
+
+// The items of `queryString` (the text after "?") that have a value (an empty
+// one counts; a bare name does not), decoded; "+" stays "+". A name given
+// more than once keeps its last value. Empty when the text is not a query.
+std::map<std::string, std::string> getQueryItemsDictionary(std::string_view queryString);
+
+namespace CustomHeaders {
+// Sets each header field of `headers` on `request`, replacing a value set
+// earlier under the same name in any letter case; other fields stay. None
+// changes nothing.
+void setHeaders(MutableURLRequest& request, const std::optional<StringDictionary>& headers);
+}  // namespace CustomHeaders
+
+// A URL made from text that is already a valid URL reference: unlike
+// URL::URLWithString, nothing is percent-encoded, so text holding a space or
+// a non-ASCII character gives null.
+class KivURL : public URL {
+ public:
+  static std::shared_ptr<const KivURL> initWithString(std::string_view string);
+  // Null for none; otherwise initWithString().
+  static std::shared_ptr<const KivURL> URLWithString(const std::optional<std::string>& string);
+
+  std::string className() const override { return "KivURL"; }
+
+ private:
+  explicit KivURL(std::string string) : URL(std::move(string)) {}
+};
+
+class HTTPCookieUtils {
+ public:
+  // The cookies, in their order, whose domain (lowercased, without leading
+  // and trailing dots) ends with one of `domains` (lowercased). This is a
+  // plain suffix test: "example.com" also keeps "myexample.com", and a
+  // leading dot in `domains` (".example.com") keeps subdomains only. An empty
+  // string in `domains` keeps every cookie. Lowercasing follows Unicode, so
+  // internationalised domains compare as expected.
+  static std::vector<HTTPCookiePtr> filterCookies(const std::vector<HTTPCookiePtr>& cookies,
+                                                  const std::vector<std::string>& domains);
+};
+
+}  // namespace kivi
