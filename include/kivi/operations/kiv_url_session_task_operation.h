@@ -1,0 +1,100 @@
+// URL-session task operations: asynchronous operations whose work is one
+// task of a URLSession. This layer holds the session, the request, the task
+// while it runs and the HTTP response, and ties cancellation to the task:
+// cancel() sets the operation's cancelled flag, then cancels the stored task.
+// It creates, starts and completes nothing itself; a subclass does that
+// (KivJSONAPIOperation is the model):
+//   1. in start(), create the task from urlSession(), store it
+//      (setSessionTaskOperationHandle / setUrlSessionTask), then resume it;
+//   2. in the task's completion, store the response (setUrlResponse), set
+//      completionError, call coreCompleteOperation().
+//
+// Two variants: KivUrlSessionTaskOperationObjC (on KivAsyncOperationObjC) and
+// KivUrlSessionTaskOperation (on KivAsyncOperation, session fixed at
+// creation).
+//
+// Thread contract: cancel() may come from any thread; it reads the stored
+// task once, after the cancelled flag is set. A cancel that arrives after
+// start() checked isCancelled() but before it stored the task reaches no
+// task, and the request runs to its normal end. The fields are read and
+// written under a small lock; nothing else is synchronised.
+#pragma once
+
+#include <mutex>
+#include <optional>
+
+#include "kivi/foundation/http_url_response.h"
+#include "kivi/foundation/url_request.h"
+#include "kivi/foundation/url_session.h"
+#include "kivi/operations/kiv_async_operation.h"
+
+namespace kivi {
+
+namespace detail {
+// The request, response and task both variants keep, under one lock.
+class UrlSessionTaskFields {
+ public:
+  std::optional<URLRequest> request() const;
+  void setRequest(std::optional<URLRequest> request);
+  HTTPURLResponsePtr response() const;
+  void setResponse(HTTPURLResponsePtr response);
+  URLSessionTaskPtr task() const;
+  void setTask(URLSessionTaskPtr task);
+
+ private:
+  mutable std::mutex mutex_;
+  std::optional<URLRequest> request_;  // guarded by mutex_
+  HTTPURLResponsePtr response_;        // guarded by mutex_
+  URLSessionTaskPtr task_;             // guarded by mutex_
+};
+}  // namespace detail
+
+class KivUrlSessionTaskOperationObjC : public KivAsyncOperationObjC {
+ public:
+  // An operation without a session.
+  KivUrlSessionTaskOperationObjC() = default;
+  // initWithUrlSession:
+  explicit KivUrlSessionTaskOperationObjC(URLSessionPtr urlSession)
+      : urlSession_(std::move(urlSession)) {}
+
+  // Cancels the operation, then the stored task, if any.
+  void cancel() override;
+
+  virtual URLSessionPtr urlSession() const;
+  virtual void setUrlSession(URLSessionPtr urlSession);
+  virtual std::optional<URLRequest> urlRequest() const;
+  virtual void setUrlRequest(std::optional<URLRequest> urlRequest);
+  virtual HTTPURLResponsePtr urlResponse() const;
+  virtual void setUrlResponse(HTTPURLResponsePtr urlResponse);
+  virtual URLSessionTaskPtr sessionTaskOperationHandle() const;
+  virtual void setSessionTaskOperationHandle(URLSessionTaskPtr task);
+
+ private:
+  mutable std::mutex sessionMutex_;
+  URLSessionPtr urlSession_;  // guarded by sessionMutex_
+  detail::UrlSessionTaskFields fields_;
+};
+
+class KivUrlSessionTaskOperation : public KivAsyncOperation {
+ public:
+  // init(urlSession:)
+  explicit KivUrlSessionTaskOperation(URLSessionPtr urlSession)
+      : urlSession_(std::move(urlSession)) {}
+
+  // Cancels the operation, then the stored task, if any.
+  void cancel() override;
+
+  const URLSessionPtr& urlSession() const noexcept { return urlSession_; }
+  virtual URLSessionTaskPtr urlSessionTask() const;
+  virtual void setUrlSessionTask(URLSessionTaskPtr task);
+  virtual std::optional<URLRequest> urlRequest() const;
+  virtual void setUrlRequest(std::optional<URLRequest> urlRequest);
+  virtual HTTPURLResponsePtr urlResponse() const;
+  virtual void setUrlResponse(HTTPURLResponsePtr urlResponse);
+
+ private:
+  const URLSessionPtr urlSession_;
+  detail::UrlSessionTaskFields fields_;
+};
+
+}  // namespace kivi
