@@ -23,6 +23,7 @@ std::vector<Command> allCommands();
 
 // The commands, one factory per file.
 Command demoCommand();
+Command getCommand();
 
 // Whether `args` asks for help ("-h" or "--help" anywhere).
 bool wantsHelp(const std::vector<std::string>& args);

@@ -1,5 +1,7 @@
 // kivi demo: runs asynchronous operations through an atomic workflow service
 // and a concurrent service, printing each observed state transition.
+#include <httplib.h>
+
 #include <chrono>
 #include <condition_variable>
 #include <cstdio>
@@ -12,9 +14,12 @@
 
 #include "command.h"
 #include "kivi/foundation/error.h"
+#include "kivi/foundation/json_serialization.h"
+#include "kivi/foundation/url_session.h"
 #include "kivi/foundation/worker_pool.h"
 #include "kivi/operations/kiv_async_operation.h"
 #include "kivi/operations/kiv_async_service.h"
+#include "kivi/operations/kiv_json_api_operation.h"
 
 namespace kivi::tool {
 
@@ -171,6 +176,141 @@ class SimulatedWork : public Base {
   milliseconds duration_;
 };
 
+// A small JSON API on 127.0.0.1, on a port the system picks.
+class DemoServer {
+ public:
+  DemoServer() {
+    auto json = [](int status, const char* body) {
+      return [status, body](const httplib::Request&, httplib::Response& res) {
+        res.status = status;
+        res.set_content(body, "application/json");
+      };
+    };
+    server_.set_tcp_nodelay(true);
+    server_.Get("/profile", json(200, R"({"name":"Ada","plan":"pro"})"));
+    server_.Get("/session", json(401, R"({"error":"token expired"})"));
+    server_.Get("/admin", json(403, R"({"error":"forbidden"})"));
+    server_.Get("/broken", json(200, R"({"name":"Ada",)"));
+    server_.Get("/status.txt", [](const httplib::Request&, httplib::Response& res) {
+      res.set_content("all good", "text/plain");
+    });
+    // Answers only after the demo has cancelled the request (or 5 s).
+    server_.Get("/slow", [this](const httplib::Request&, httplib::Response& res) {
+      std::unique_lock lock(mutex_);
+      slowArrived_ = true;
+      cv_.notify_all();
+      cv_.wait_for(lock, std::chrono::seconds(5), [&] { return released_; });
+      res.set_content(R"({"late":true})", "application/json");
+    });
+    port_ = server_.bind_to_any_port("127.0.0.1");
+    if (port_ > 0) thread_ = std::thread([this] { server_.listen_after_bind(); });
+  }
+  ~DemoServer() {
+    releaseSlow();
+    server_.stop();
+    if (thread_.joinable()) thread_.join();
+  }
+
+  bool running() const { return port_ > 0; }
+  std::string url(const std::string& path) const {
+    return "http://127.0.0.1:" + std::to_string(port_) + path;
+  }
+  bool waitForSlowRequest(milliseconds timeout) {
+    std::unique_lock lock(mutex_);
+    return cv_.wait_for(lock, timeout, [&] { return slowArrived_; });
+  }
+  void releaseSlow() {
+    std::lock_guard lock(mutex_);
+    released_ = true;
+    cv_.notify_all();
+  }
+
+ private:
+  httplib::Server server_;
+  int port_ = -1;
+  std::thread thread_;
+  std::mutex mutex_;
+  std::condition_variable cv_;
+  bool slowArrived_ = false;  // guarded by mutex_
+  bool released_ = false;     // guarded by mutex_
+};
+
+// Accepts a 2xx answer with a JSON body.
+class DemoCall : public KivJSONAPIOperation {
+ public:
+  using KivJSONAPIOperation::KivJSONAPIOperation;
+  void processHTTPUrlResponse(HTTPURLResponsePtr response,
+                              const std::optional<Data>& data) override {
+    const bool ok = response && response->statusCode() / 100 == 2 &&
+                    JSONSerialization::JSONObjectWithData(data.value_or(Data{}), 0, nullptr);
+    completeOperationWithStatus(ok ? KivJSONAPIOperationCompletionStatusSuccess
+                                   : KivJSONAPIOperationCompletionStatusInvalidServerResponse,
+                                nullptr);
+  }
+};
+
+std::string outcome(const KivJSONAPIOperation& call) {
+  std::string name = KivJSONAPIOperation::descriptionForCompletionStatus(call.completionStatus());
+  name.erase(0, std::string_view("KivJSONAPIOperationCompletionStatus").size());
+  std::string text = "status " + name;
+  if (auto response = call.urlResponse())
+    text += " (http " + std::to_string(response->statusCode()) + ")";
+  if (auto error = call.completionError()) {
+    text += "; error " + error->domain() + " " + std::to_string(error->code()) + ": " +
+            error->localizedDescription();
+  }
+  return text;
+}
+
+// 3. REST calls, one atomic workflow each, against the embedded server.
+int runRestCalls(Journal& journal, TransitionPrinter& printer, std::ostream& err) {
+  DemoServer server;
+  if (!server.running()) {
+    err << "kivi demo: could not start the embedded server on 127.0.0.1\n";
+    return 1;
+  }
+  journal.heading("REST calls through KivAtomicWorkflowService against " + server.url("/"));
+  auto service = std::make_shared<KivAtomicWorkflowService>("kivi.demo.rest");
+  auto session =
+      URLSession::sessionWithConfiguration(URLSessionConfiguration::defaultSessionConfiguration());
+  const std::pair<const char*, const char*> calls[] = {
+      {"profile", "/profile"},       {"session", "/session"}, {"admin", "/admin"},
+      {"status.txt", "/status.txt"}, {"broken", "/broken"},   {"slow", "/slow"}};
+  Countdown done(static_cast<int>(std::size(calls)));
+  std::vector<std::shared_ptr<DemoCall>> ops;
+  for (const auto& [label, path] : calls) {
+    auto op = std::make_shared<DemoCall>(URL::URLWithString(server.url(path)), session);
+    printer.watch(op, label);
+    std::weak_ptr<KivAtomicWorkflowService> weakService = service;
+    std::weak_ptr<DemoCall> weakOp = op;
+    op->setCompletionBlock([&, weakService, weakOp, label = std::string(label)] {
+      if (auto call = weakOp.lock()) journal.line(label, outcome(*call));
+      if (auto s = weakService.lock()) s->endAtomicWorkflow();
+      done.done();
+    });
+    ops.push_back(op);
+  }
+  for (const auto& op : ops) {
+    service->startAtomicWorkflowWithOperation(op);
+    journal.line(printer.label(op.get()), service->pendingOperations()->empty()
+                                              ? "handed to the queue (workflow begins)"
+                                              : "parked");
+  }
+  // The last call hangs on the server until it is cancelled.
+  if (server.waitForSlowRequest(std::chrono::seconds(20))) {
+    journal.line("slow", "request reached the server; cancelling it");
+    ops.back()->cancel();
+  }
+  const bool finished = done.wait(std::chrono::seconds(20));
+  server.releaseSlow();
+  service->operationQueue()->waitUntilAllOperationsAreFinished();
+  if (!finished) {
+    err << "kivi demo: the REST calls did not finish in time\n";
+    return 1;
+  }
+  return 0;
+}
+
 int runDemo(const std::vector<std::string>& args, std::ostream& out, std::ostream& err) {
   if (!args.empty()) {
     err << "kivi demo: unexpected argument '" << args[0] << "'\n";
@@ -258,6 +398,8 @@ int runDemo(const std::vector<std::string>& args, std::ostream& out, std::ostrea
   service.operationQueue()->waitUntilAllOperationsAreFinished();
   workflows->operationQueue()->waitUntilAllOperationsAreFinished();
 
+  if (int failed = runRestCalls(journal, *printer, err)) return failed;
+
   out << "\nParked workflows were released in this order:";
   for (const auto& name : released) out << " " << name;
   out << "\nMost operations executing at once: " << printer->maxExecuting()
@@ -275,7 +417,11 @@ Command demoCommand() {
           "one of them cancelled while parked) and a KivAsyncService with a limit of 2\n"
           "(one dependency, one operation held back by its readiness gate). Prints each\n"
           "observed transition with a timestamp, then the order in which parked\n"
-          "workflows were released.\n",
+          "workflows were released.\n\n"
+          "Then starts a small JSON server on 127.0.0.1 (no outside network needed) and\n"
+          "runs one REST call per atomic workflow against it, showing the statuses\n"
+          "Success, Unauthorized, AccessDenied, InvalidContentType, InvalidServerResponse\n"
+          "and Cancelled (a request cancelled while the server holds it).\n",
           runDemo};
 }
 

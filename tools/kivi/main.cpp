@@ -8,7 +8,7 @@
 
 namespace kivi::tool {
 
-std::vector<Command> allCommands() { return {demoCommand()}; }
+std::vector<Command> allCommands() { return {demoCommand(), getCommand()}; }
 
 bool wantsHelp(const std::vector<std::string>& args) {
   for (const auto& a : args) {
