@@ -8,20 +8,12 @@
 #include <cstdlib>
 #include <string_view>
 
+#include "fuzz_check.h"
 #include "kivi/foundation/url.h"
 #include "kivi/foundation/url_components.h"
 #include "kivi/utils/url_utils.h"
 
-namespace {
-
-void check(bool condition, const char* what, std::string_view input) {
-  if (condition) return;
-  std::fprintf(stderr, "check failed: %s\ninput: \"%.*s\"\n", what, static_cast<int>(input.size()),
-               input.data());
-  std::abort();
-}
-
-}  // namespace
+using kivi::fuzz::check;
 
 extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size) {
   const std::string_view text(reinterpret_cast<const char*>(data), size);
