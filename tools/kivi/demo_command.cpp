@@ -410,7 +410,7 @@ int runDemo(const std::vector<std::string>& args, std::ostream& out, std::ostrea
 }  // namespace
 
 Command demoCommand() {
-  return {"demo", "run operations through the workflow and concurrent services",
+  return {"demo", "run operations, workflows and REST calls against an embedded server",
           "usage: kivi demo\n\n"
           "Runs simulated asynchronous operations through a KivAtomicWorkflowService\n"
           "(one workflow at a time, later ones parked and released in arrival order,\n"
