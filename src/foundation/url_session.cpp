@@ -444,15 +444,10 @@ void URLSessionCore::finish(std::unique_ptr<Transfer> t, CURLcode result) {
     if (auto moved = URL::URLWithString(effective)) responseURL = std::move(moved);
   }
   StringDictionary fields;
+  // Names are canonical already, so a repeated field has the identical key.
   for (auto& header : t->headers) {
-    auto it = std::find_if(fields.begin(), fields.end(), [&](const auto& f) {
-      return headerFieldNamesEqual(f.first, header.first);
-    });
-    if (it == fields.end()) {
-      fields.emplace(std::move(header.first), std::move(header.second));
-    } else {
-      it->second.append(", ").append(header.second);
-    }
+    auto [it, inserted] = fields.try_emplace(std::move(header.first), header.second);
+    if (!inserted) it->second.append(", ").append(header.second);
   }
   auto response = HTTPURLResponse::create(responseURL, status, versionText(version), fields);
   Data body = std::move(t->received);
