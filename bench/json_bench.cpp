@@ -19,7 +19,9 @@
 #include <benchmark/benchmark.h>
 
 #include <cstdint>
+#include <memory>
 #include <nlohmann/json.hpp>
+#include <optional>
 #include <random>
 #include <string>
 #include <string_view>
@@ -94,8 +96,10 @@ std::optional<kivi::Value> readKivi(const std::string& text) {
   return kivi::JSONSerialization::JSONObjectWithData(text, 0, nullptr);
 }
 
-std::optional<nlohmann::json> readNlohmann(const std::string& text) {
-  std::optional<nlohmann::json> value = nlohmann::json::parse(text, nullptr, false);
+// Held by pointer: GCC 12 misreads std::optional<nlohmann::json> as possibly
+// uninitialised inside nlohmann's header.
+std::unique_ptr<nlohmann::json> readNlohmann(const std::string& text) {
+  auto value = std::make_unique<nlohmann::json>(nlohmann::json::parse(text, nullptr, false));
   if (value->is_discarded()) value.reset();
   return value;
 }

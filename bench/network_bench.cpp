@@ -167,6 +167,15 @@ bool answeredOk(CURL* easy, const std::string& body) {
   return status == 200 && !body.empty();
 }
 
+// Marks the benchmark failed unless the request succeeded.
+bool succeeded(benchmark::State& state, const KivJSONAPIOperation& operation) {
+  if (operation.completionStatus() == KivJSONAPIOperationCompletionStatusSuccess) return true;
+  state.SkipWithError(("request failed: " + KivJSONAPIOperation::descriptionForCompletionStatus(
+                                                operation.completionStatus()))
+                          .c_str());
+  return false;
+}
+
 void BM_JSONAPIOperationSequentialGets(benchmark::State& state) {
   const URLPtr url = URL::URLWithString(localServer().url("/json"));
   const URLSessionPtr session =
@@ -178,13 +187,7 @@ void BM_JSONAPIOperationSequentialGets(benchmark::State& state) {
       auto operation = std::make_shared<BenchGet>(url, session);
       queue->addOperation(operation);
       operation->waitUntilFinished();
-      if (operation->completionStatus() != KivJSONAPIOperationCompletionStatusSuccess) {
-        state.SkipWithError(
-            ("request failed: " +
-             KivJSONAPIOperation::descriptionForCompletionStatus(operation->completionStatus()))
-                .c_str());
-        return;
-      }
+      if (!succeeded(state, *operation)) return;
     }
   }
   reportRequests(state, kSequentialRequests);
@@ -239,13 +242,7 @@ void BM_JSONAPIOperationConcurrent64(benchmark::State& state) {
     }
     queue->waitUntilAllOperationsAreFinished();
     for (const auto& operation : operations) {
-      if (operation->completionStatus() != KivJSONAPIOperationCompletionStatusSuccess) {
-        state.SkipWithError(
-            ("request failed: " +
-             KivJSONAPIOperation::descriptionForCompletionStatus(operation->completionStatus()))
-                .c_str());
-        return;
-      }
+      if (!succeeded(state, *operation)) return;
     }
   }
   reportRequests(state, kConcurrentRequests);
