@@ -18,12 +18,18 @@ struct Command {
       run;
 };
 
-// Every command of the tool, in the order `kivi --help` lists them.
+// Every registered command, in the order `kivi --help` lists them.
 std::vector<Command> allCommands();
 
-// The commands, one factory per file.
-Command demoCommand();
-Command getCommand();
+// Each command file registers its factory at start-up:
+//
+//   Command fooCommand() { ... }
+//   const CommandRegistration kRegistration{30, &fooCommand};
+//
+// `order` places the command in `kivi --help`; lower comes first.
+struct CommandRegistration {
+  CommandRegistration(int order, Command (*factory)());
+};
 
 // Whether `args` asks for help ("-h" or "--help" anywhere).
 bool wantsHelp(const std::vector<std::string>& args);

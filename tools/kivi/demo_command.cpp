@@ -425,4 +425,6 @@ Command demoCommand() {
           runDemo};
 }
 
+const CommandRegistration kRegistration{10, &demoCommand};
+
 }  // namespace kivi::tool

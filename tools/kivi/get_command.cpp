@@ -211,4 +211,6 @@ Command getCommand() {
           runGet};
 }
 
+const CommandRegistration kRegistration{20, &getCommand};
+
 }  // namespace kivi::tool

@@ -1,4 +1,5 @@
 // kivi: the sample command-line host of the library.
+#include <algorithm>
 #include <iostream>
 #include <string>
 #include <vector>
@@ -8,7 +9,35 @@
 
 namespace kivi::tool {
 
-std::vector<Command> allCommands() { return {demoCommand(), getCommand()}; }
+namespace {
+
+struct Registered {
+  int order;
+  Command (*factory)();
+};
+
+// A function-local static: registrations run during static initialisation of
+// the other files, in no fixed order.
+std::vector<Registered>& registry() {
+  static std::vector<Registered> entries;
+  return entries;
+}
+
+}  // namespace
+
+CommandRegistration::CommandRegistration(int order, Command (*factory)()) {
+  registry().push_back({order, factory});
+}
+
+std::vector<Command> allCommands() {
+  auto entries = registry();
+  std::stable_sort(entries.begin(), entries.end(),
+                   [](const Registered& a, const Registered& b) { return a.order < b.order; });
+  std::vector<Command> commands;
+  commands.reserve(entries.size());
+  for (const auto& entry : entries) commands.push_back(entry.factory());
+  return commands;
+}
 
 bool wantsHelp(const std::vector<std::string>& args) {
   for (const auto& a : args) {
