@@ -50,8 +50,9 @@ std::string toUpper(std::string_view text);
 // above U+10FFFF). An embedded NUL is valid UTF-8.
 bool isValidUTF8(std::string_view bytes);
 
-// The number of UTF-16 code units `text` takes (each malformed byte counts as
-// one, as U+FFFD would).
+// The number of UTF-16 code units `text` takes. Each malformed sequence (a
+// stray byte, or a truncated lead byte with its continuation bytes) counts as
+// one unit, the U+FFFD that replaces it.
 std::size_t utf16Length(std::string_view text);
 
 }  // namespace kivi::unicode
