@@ -1,0 +1,126 @@
+#include "kivi/launch/kiv_ulo_file_parser.h"
+
+#include <gtest/gtest.h>
+
+#include <optional>
+#include <string>
+#include <vector>
+
+#include "kivi/launch/tev_app_launch_constants.h"
+
+namespace kivi {
+namespace {
+
+using namespace std::string_literals;
+using std::nullopt;
+
+// Every row runs through the parser, the regular-expression lookup and, for
+// plain names, the plain search: all must agree.
+TEST(KivUloFileParserTest, LookupsAgreeOnEveryPath) {
+  const struct {
+    std::string text;
+    std::string key;
+    std::optional<std::string> expected;
+  } cases[] = {
+      {"A=1\r\nB=2\r\n", "A", "1"},
+      {"A=1\r\nB=2\r\n", "B", "2"},
+      {"A=1\r\nB=2\r\n", "a", nullopt},
+      {"A=1\nB=2", "B", nullopt},
+      {"A=1\nB=2", "A", "1"},
+      {"A=1\nA=2\n", "A", "1"},
+      {"ClientAddress=10.0.0.1\nAddress=2\n", "Address", "10.0.0.1"},
+      {"A= x \n", "A", " x"},
+      {"A=\n", "A", ""},
+      {"A = 1\n", "A", nullopt},
+      {"X=1;A=2\n", "A", "2"},
+      {"[Section]\n# A=comment\nA=1\n", "A", "comment"},
+      {"x=1\n", "", "1"},
+      // Names with regular-expression syntax.
+      {"A(=1\n", "A(", nullopt},
+      {"AxB=5\n", "A.B", "5"},
+      {"AAA=3\n", "A+", "3"},
+      {"A+=3\n", "A+", nullopt},
+      {"[=1\n", "[", nullopt},
+      {"B=2\n", "A|B", "2"},
+      {"A=1\n", "A|B", nullopt},  // matches "A" alone: no "=" to split at
+      {"A=B=C\n", "A=B", "B=C"},
+      {"x A=1\n", " A", "1"},
+      // Lines ending in a terminator other than CR or LF hold no setting.
+      {"A=1\vB=2\n", "A", nullopt},
+      {"A=1\vB=2\n", "B", "2"},
+      {"A=1\f\n", "A", nullopt},
+      {"A=1\u0085\n", "A", nullopt},
+      {"A=1\u2028\n", "A", nullopt},
+      {"A=1\u2029A=2\r\n", "A", "2"},
+      {"A=1 A=2\vA=3\n", "A", "3"},
+      // CR and LF runs, trailing white space of any kind.
+      {"A=1\r\n\r\n\nB=2\r\n", "B", "2"},
+      {"A=x\r\r\n\n", "A", "x"},
+      {"A=1\r", "A", "1"},
+      {"A=x\t \u00a0\n", "A", "x"},
+      {"A=\u3000x\u3000\r\n", "A", "\u3000x"},
+      {"A=x\0y\n"s, "A", "x\0y"s},
+      // Malformed UTF-8 reads as U+FFFD; values come back byte for byte.
+      {"\xff"
+       "A=\xfe\xe2\x80\n",
+       "A", "\xfe\xe2\x80"},
+      {"A=1\xe2\xe2\x80\xa8"
+       "A=2\n",
+       "A", "2"},
+      {"A=1\xc2\n", "A", "1\xc2"},
+  };
+  for (const auto& row : cases) {
+    SCOPED_TRACE(testing::PrintToString(row.text) + " key " + row.key);
+    EXPECT_EQ(KivUloFileParser(row.text).getValue(row.key), row.expected);
+    EXPECT_EQ(detail::uloValueByPattern(row.text, row.key), row.expected);
+    if (detail::isPlainUloKey(row.key)) {
+      EXPECT_EQ(detail::uloValueByPlainSearch(row.text, row.key), row.expected);
+    }
+  }
+}
+
+TEST(KivUloFileParserTest, BooleanValueLowerCasesTheValueOnly) {
+  using List = std::vector<std::string>;
+  const struct {
+    const char* text;
+    List trueValues;
+    bool expected;
+  } cases[] = {
+      {"Flag=ON\n", {"on"}, true},
+      {"Flag=ON\n", {"ON"}, false},
+      {"Flag=ON\n", {}, false},
+      {"Flag=\tyes\n", {"yes"}, false},
+      {"Flag=\n", {"", "on"}, true},
+      {"Other=1\n", {"1"}, false},
+      {"Flag=E\u0301\n", {"\u00e9"}, true},  // lower-cased, then canonically equal
+  };
+  for (const auto& row : cases) {
+    SCOPED_TRACE(row.text);
+    EXPECT_EQ(KivUloFileParser(row.text).getBooleanValue("Flag", row.trueValues), row.expected);
+  }
+}
+
+TEST(KivUloFileParserTest, LargeAdversarialTextsStayBounded) {
+  // Every "K=" sits on a line ending in VT: the plain search skips the line
+  // once, where a backtracking search would rescan it per occurrence.
+  std::string repeats;
+  for (int i = 0; i < (1 << 19); ++i) repeats += "K=";
+  EXPECT_EQ(KivUloFileParser(repeats + "\vK=ok\n").getValue("K"), "ok");
+
+  // Quadratic for the engine: the step budget ends the search.
+  const std::string line(256 << 10, 'a');
+  EXPECT_EQ(KivUloFileParser(line + "\n").getValue(".*.*b"), nullopt);
+}
+
+TEST(TEVAppLaunchConstantsTest, AnswersTheFixedStrings) {
+  TEVAppLaunchConstants constants;
+  (void)constants;
+  EXPECT_EQ(TEVAppLaunchConstants::clientAddress(), "127.0.0.1");
+  EXPECT_EQ(TEVAppLaunchConstants::zorvikTransactionIdHeaderName(), "Zorvik-TransactionId");
+  EXPECT_EQ(TEVAppLaunchConstants::contentTypeHeader(), "Content-Type");
+  EXPECT_EQ(TEVAppLaunchConstants::launchMimeType(), "application/vnd.zorvik.launchparams+xml");
+  EXPECT_EQ(&TEVAppLaunchConstants::launchMimeType(), &TEVAppLaunchConstants::launchMimeType());
+}
+
+}  // namespace
+}  // namespace kivi
