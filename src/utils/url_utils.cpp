@@ -86,4 +86,17 @@ std::vector<HTTPCookiePtr> HTTPCookieUtils::filterCookies(const std::vector<HTTP
   return kept;
 }
 
+std::vector<Dictionary> HTTPCookieUtils::cookiesForLogging(
+    const std::vector<HTTPCookiePtr>& cookies) {
+  std::vector<Dictionary> records;
+  records.reserve(cookies.size());
+  for (const HTTPCookiePtr& cookie : cookies) {
+    if (!cookie) continue;
+    records.push_back({{HTTPCookieName, Value(cookie->name())},
+                       {HTTPCookieValue, Value(cookie->value().empty() ? "" : "***")},
+                       {HTTPCookieDomain, Value(cookie->domain())}});
+  }
+  return records;
+}
+
 }  // namespace kivi

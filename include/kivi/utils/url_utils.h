@@ -6,6 +6,7 @@
 //   CustomHeaders::setHeaders        sets several header fields on a request
 //   KivURL                           a URL that refuses text needing encoding
 //   HTTPCookieUtils::filterCookies   the cookies belonging to some domains
+//   HTTPCookieUtils::cookiesForLogging  cookies with their values masked
 //
 //   auto components = *kivi::URLComponents::fromString("https://api.example.com/v1/items");
 //   kivi::KiviOSSdkUtils::addQueryItems(components, {{"page", "2"}, {"q", "a&b"}});
@@ -17,6 +18,7 @@
 //   kivi::CustomHeaders::setHeaders(request, kivi::StringDictionary{{"Accept", "text/plain"}});
 //
 //   auto mine = kivi::HTTPCookieUtils::filterCookies(cookies, {"example.com"});
+//   auto records = kivi::HTTPCookieUtils::cookiesForLogging(mine);
 //
 // Thread contract: all of these are pure functions of their arguments, safe to
 // call from any thread. addQueryItems and setHeaders change only the object
@@ -82,6 +84,11 @@ class HTTPCookieUtils {
   // internationalised domains compare as expected.
   static std::vector<HTTPCookiePtr> filterCookies(const std::vector<HTTPCookiePtr>& cookies,
                                                   const std::vector<std::string>& domains);
+
+  // One record per cookie, in order, safe to log: exactly the entries
+  // HTTPCookieName (the name), HTTPCookieValue ("***", or "" for an empty
+  // value) and HTTPCookieDomain (the domain). Null pointers are skipped.
+  static std::vector<Dictionary> cookiesForLogging(const std::vector<HTTPCookiePtr>& cookies);
 };
 
 }  // namespace kivi

@@ -1,0 +1,118 @@
+#include "kivi/logging/log_redaction.h"
+
+#include <algorithm>
+
+#include "kivi/foundation/http_cookie.h"
+#include "kivi/foundation/unicode_text.h"
+#include "kivi/foundation/url_components.h"
+
+namespace kivi {
+
+namespace {
+
+constexpr const char* kMask = "***";
+
+std::string masked(const std::string& value) { return value.empty() ? "" : kMask; }
+Value masked(const Value& value) {
+  const std::string* text = value.asString();
+  return Value(text ? masked(*text) : kMask);
+}
+
+const StringDictionary& textFields(const StringDictionary& headers) { return headers; }
+StringDictionary textFields(const Dictionary& headers) {
+  StringDictionary fields;
+  for (const auto& [name, value] : headers) {
+    if (const std::string* text = value.asString()) fields.emplace(name, *text);
+  }
+  return fields;
+}
+
+// Masks "Authorization" and rewrites "Set-Cookie" in place; works on both
+// header dictionary forms.
+template <class Headers>
+void redact(Headers& headers, const URLPtr& url) {
+  if (auto authorization = headers.find("Authorization"); authorization != headers.end()) {
+    authorization->second = masked(authorization->second);
+  }
+  if (!url) return;
+  const auto cookies = HTTPCookie::cookiesWithResponseHeaderFields(textFields(headers), *url);
+  if (cookies.empty()) return;
+  std::string list;
+  for (const HTTPCookiePtr& cookie : cookies) {
+    list += cookie->name() + "=" + masked(cookie->value()) + ", path=" + cookie->path() +
+            ", domain=" + cookie->domain() + ";";
+  }
+  headers.insert_or_assign("Set-Cookie", std::move(list));
+}
+
+bool kept(const std::string& name, const std::vector<std::string>& keep) {
+  return std::find(keep.begin(), keep.end(), name) != keep.end();
+}
+
+}  // namespace
+
+std::optional<std::string> KivSdkURLForLogging(const URLPtr& url) {
+  if (!url) return std::nullopt;
+  URLComponents components = URLComponents::fromURL(*url);
+  auto items = components.queryItems().value_or(std::vector<URLQueryItem>{});
+  for (URLQueryItem& item : items) item.value = masked(item.value.value_or(""));
+  components.setQueryItems(items.empty() ? std::nullopt : std::optional(std::move(items)));
+  const auto text = components.string();
+  if (!text) return std::nullopt;
+  auto decoded = percent_encoding::decode(*text);
+  if (!decoded || !unicode::isValidUTF8(*decoded)) return std::nullopt;
+  return decoded;
+}
+
+std::string KivSdkTokenForLogging(const std::optional<std::string>& token) {
+  return token && !token->empty() ? kMask : "nil";
+}
+
+HeaderDictionaryPtr KivSdkResponseHeadersForLogging(const HeaderDictionaryPtr& headers,
+                                                    const URLPtr& url) {
+  if (!headers || headers->empty()) return headers;
+  StringDictionary copy = *headers;
+  redact(copy, url);
+  return std::make_shared<const StringDictionary>(std::move(copy));
+}
+
+Value KivSdkResponseHeadersForLogging(const Value& headers, const URLPtr& url) {
+  const Dictionary* dictionary = headers.asDictionary();
+  if (!dictionary || dictionary->empty()) return headers;
+  Dictionary copy = *dictionary;
+  redact(copy, url);
+  return Value(std::move(copy));
+}
+
+HTTPURLResponsePtr KivSdkResponseForLogging(const HTTPURLResponsePtr& response) {
+  if (!response) return nullptr;
+  const HeaderDictionaryPtr headers = KivSdkResponseHeadersForLogging(
+      std::make_shared<const StringDictionary>(response->allHeaderFields()), response->URL());
+  const auto text = KivSdkURLForLogging(response->URL());
+  URLPtr url = text ? URL::URLWithString(*text) : nullptr;
+  if (!url) return response;
+  return HTTPURLResponse::create(std::move(url), response->statusCode(), "1.0", *headers);
+}
+
+StringDictionary KivSdkObfuscateHeadersForLogging(const HeaderDictionaryPtr& headers,
+                                                  const std::vector<std::string>& keep) {
+  StringDictionary result;
+  if (!headers) return result;
+  for (const auto& [name, value] : *headers) {
+    result.emplace_hint(result.end(), name, kept(name, keep) ? value : kMask);
+  }
+  return result;
+}
+
+Dictionary KivSdkObfuscateHeadersForLogging(const Value& headers,
+                                            const std::vector<std::string>& keep) {
+  Dictionary result;
+  const Dictionary* dictionary = headers.asDictionary();
+  if (!dictionary) return result;
+  for (const auto& [name, value] : *dictionary) {
+    result.emplace_hint(result.end(), name, kept(name, keep) ? value : Value(kMask));
+  }
+  return result;
+}
+
+}  // namespace kivi
