@@ -6,6 +6,7 @@
 
 #include "command.h"
 #include "kivi/version.h"
+#include "verbose.h"
 
 namespace kivi::tool {
 
@@ -49,7 +50,7 @@ bool wantsHelp(const std::vector<std::string>& args) {
 namespace {
 
 void printHelp(std::ostream& out) {
-  out << "usage: kivi <command> [arguments]\n\n"
+  out << "usage: kivi [--verbose] <command> [arguments]\n\n"
          "The sample host of the KiviOSSDK library "
       << KiviOSSDKVersionString
       << ".\n\n"
@@ -59,13 +60,20 @@ void printHelp(std::ostream& out) {
         << std::string(command.name.size() < 12 ? 12 - command.name.size() : 1, ' ')
         << command.summary << "\n";
   }
-  out << "\nRun 'kivi <command> --help' for a command's own options.\n";
+  out << "\nOptions:\n"
+         "  --verbose   log the tool's steps to standard error\n"
+         "\nRun 'kivi <command> --help' for a command's own options.\n";
 }
 
 }  // namespace
 
 int main(int argc, char** argv) {
   std::vector<std::string> args(argv + 1, argv + argc);
+  // Global options come before the command name.
+  while (!args.empty() && args[0] == "--verbose") {
+    enableVerboseLogging(std::cerr);
+    args.erase(args.begin());
+  }
   if (args.empty() || args[0] == "-h" || args[0] == "--help" || args[0] == "help") {
     printHelp(args.empty() ? std::cerr : std::cout);
     return args.empty() ? 2 : 0;
@@ -81,6 +89,7 @@ int main(int argc, char** argv) {
       std::cout << command.usage;
       return 0;
     }
+    logger().logInfo(nullptr, __FILE__, __func__, __LINE__, "running command " + command.name);
     return command.run(rest, std::cout, std::cerr);
   }
   std::cerr << "kivi: unknown command '" << args[0] << "'\n\n";

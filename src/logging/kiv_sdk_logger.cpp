@@ -1,0 +1,151 @@
+#include "kivi/logging/kiv_sdk_logger.h"
+
+#include <cstdint>
+#include <cstring>
+#include <string>
+#include <string_view>
+#include <thread>
+
+#include "kivi/foundation/unicode_text.h"
+
+namespace kivi {
+namespace {
+
+constexpr std::string_view kUnknown = "<unknown>";
+
+// Source file and function names are nearly always ASCII: check that eight
+// bytes at a time before asking the full validator.
+bool isAscii(std::string_view text) {
+  std::uint64_t bits = 0;
+  std::size_t i = 0;
+  for (; i + 8 <= text.size(); i += 8) {
+    std::uint64_t word;
+    std::memcpy(&word, text.data() + i, 8);
+    bits |= word;
+  }
+  for (; i < text.size(); ++i) bits |= static_cast<unsigned char>(text[i]);
+  return (bits & 0x8080808080808080ull) == 0;
+}
+
+// The text of a C string, or "<unknown>" when it is null or not UTF-8.
+std::string_view cStringView(const char* cString) {
+  if (!cString) return kUnknown;
+  const std::string_view text(cString);
+  return isAscii(text) || unicode::isValidUTF8(text) ? text : kUnknown;
+}
+
+using Method = void (KivSdkLoggerDelegate::*)(std::string_view, std::string_view, std::string_view,
+                                              std::uint64_t, std::string_view);
+
+// Indexed by level - 1.
+constexpr Method kMainMethods[] = {
+    &KivSdkLoggerDelegate::logCriticalWithModule, &KivSdkLoggerDelegate::logErrorWithModule,
+    &KivSdkLoggerDelegate::logWarnWithModule,     &KivSdkLoggerDelegate::logInfoWithModule,
+    &KivSdkLoggerDelegate::logVerboseWithModule,  &KivSdkLoggerDelegate::logSupportWithModule,
+};
+constexpr Method kAotMethods[] = {
+    &KivSdkLoggerDelegate::aotLogCriticalWithModule,
+    &KivSdkLoggerDelegate::aotLogErrorWithModule,
+    &KivSdkLoggerDelegate::aotLogWarnWithModule,
+    &KivSdkLoggerDelegate::aotLogInfoWithModule,
+};
+
+// Each thread formats into one reused buffer, so a steady stream of lines
+// allocates nothing. A delegate that logs from inside a delivery gets a
+// buffer of its own for the nested line, and so does a line logged while the
+// thread is being torn down, after the buffer is gone.
+struct Scratch {
+  ~Scratch();
+  std::string text;
+  bool inUse = false;
+};
+thread_local Scratch tScratch;
+thread_local bool tScratchGone = false;  // trivially destructible: readable to the end
+Scratch::~Scratch() { tScratchGone = true; }
+constexpr std::size_t kKeptCapacity = 4096;
+
+class MessageBuffer {
+ public:
+  MessageBuffer()
+      : owner_(!tScratchGone && !tScratch.inUse), text_(owner_ ? tScratch.text : local_) {
+    if (owner_) tScratch.inUse = true;
+    text_.clear();
+  }
+  ~MessageBuffer() {
+    if (!owner_) return;
+    if (text_.capacity() > kKeptCapacity) std::string().swap(text_);
+    tScratch.inUse = false;
+  }
+  MessageBuffer(const MessageBuffer&) = delete;
+  MessageBuffer& operator=(const MessageBuffer&) = delete;
+
+  std::string& text() { return text_; }
+
+ private:
+  bool owner_;
+  std::string local_;
+  std::string& text_;
+};
+
+// Short critical sections only: the holder copies or swaps one weak_ptr.
+class SpinGuard {
+ public:
+  explicit SpinGuard(std::atomic<bool>& flag) : flag_(flag) {
+    for (int spins = 0; flag_.exchange(true, std::memory_order_acquire); ++spins) {
+      if (spins >= 64) std::this_thread::yield();
+    }
+  }
+  ~SpinGuard() { flag_.store(false, std::memory_order_release); }
+  SpinGuard(const SpinGuard&) = delete;
+  SpinGuard& operator=(const SpinGuard&) = delete;
+
+ private:
+  std::atomic<bool>& flag_;
+};
+
+}  // namespace
+
+std::shared_ptr<KivSdkLogger> KivSdkLogger::create(
+    const std::shared_ptr<KivSdkLoggerDelegate>& delegate) {
+  std::shared_ptr<KivSdkLogger> logger(new KivSdkLogger());
+  logger->setDelegate(delegate);
+  return logger;
+}
+
+KivSdkLogger::~KivSdkLogger() = default;
+
+std::shared_ptr<KivSdkLoggerDelegate> KivSdkLogger::delegate() const {
+  if (!hasDelegate_.load(std::memory_order_acquire)) return nullptr;
+  SpinGuard guard(locked_);
+  return delegate_.lock();
+}
+
+void KivSdkLogger::setDelegate(const std::shared_ptr<KivSdkLoggerDelegate>& delegate) {
+  std::weak_ptr<KivSdkLoggerDelegate> replacement = delegate;
+  {
+    SpinGuard guard(locked_);
+    delegate_.swap(replacement);
+    hasDelegate_.store(delegate != nullptr, std::memory_order_release);
+  }
+  // The old reference is released here, outside the lock.
+}
+
+std::string KivSdkLogger::nsStringFromCString(const char* cString) {
+  return std::string(cStringView(cString));
+}
+
+void KivSdkLogger::log(bool aot, KivSdkNullableString module, KivSdkLogLevel logLevel,
+                       const char* fileName, const char* functionName, std::uint64_t lineNumber,
+                       KivSdkNullableString formatString, std::span<const FormatArg> args) const {
+  if (logLevel < 1 || logLevel > (aot ? 4u : 6u)) return;
+  const std::shared_ptr<KivSdkLoggerDelegate> target = delegate();
+  if (!target || (aot && !target->implementsAotLog(logLevel))) return;
+
+  MessageBuffer message;
+  if (!formatString.isNull()) appendFormat(message.text(), formatString.valueOr({}), args);
+  const Method method = (aot ? kAotMethods : kMainMethods)[logLevel - 1];
+  ((*target).*method)(module.valueOr(kUnknown), cStringView(fileName), cStringView(functionName),
+                      lineNumber, message.text());
+}
+
+}  // namespace kivi
