@@ -3,18 +3,60 @@
 //     never leaves one;
 //   - without the fragments option exactly the texts with an array or object
 //     at the top level read, to the same value as with it;
+//   - the two readers agree: simdjson's (the fast one) and nlohmann's (the
+//     careful one, which takes over when simdjson refuses a text). A text
+//     only the careful one accepts is refused with "Invalid JSON text (...)";
+//     a text only the fast one accepts fails to read once an integer beyond
+//     64 bits sends it to the careful one; the value read must be the same,
+//     number flavours and the sign of zero included;
 //   - every value read writes back (compact, pretty, unescaped slashes) and
 //     reads again to an equal value.
+#include <cmath>
 #include <cstddef>
 #include <cstdint>
-#include <cstdio>
-#include <cstdlib>
+#include <string>
 #include <string_view>
 
 #include "fuzz_check.h"
 #include "kivi/foundation/json_serialization.h"
 
 using kivi::fuzz::check;
+
+namespace {
+
+std::string debugDescription(const kivi::ErrorPtr& error) {
+  const auto it = error->userInfo().find(kivi::DebugDescriptionErrorKey);
+  return it != error->userInfo().end() && it->second.asString() ? *it->second.asString() : "";
+}
+
+// Equal including the number flavours and the sign of zero.
+bool identical(const kivi::Value& a, const kivi::Value& b) {
+  if (a.kind() != b.kind()) return false;
+  if (const kivi::Number* n = a.asNumber()) {
+    const kivi::Number* m = b.asNumber();
+    return n->type() == m->type() && *n == *m &&
+           std::signbit(n->doubleValue()) == std::signbit(m->doubleValue());
+  }
+  if (const kivi::Array* x = a.asArray()) {
+    const kivi::Array* y = b.asArray();
+    if (x->size() != y->size()) return false;
+    for (std::size_t i = 0; i < x->size(); ++i) {
+      if (!identical((*x)[i], (*y)[i])) return false;
+    }
+    return true;
+  }
+  if (const kivi::Dictionary* x = a.asDictionary()) {
+    const kivi::Dictionary* y = b.asDictionary();
+    if (x->size() != y->size()) return false;
+    for (auto i = x->begin(), j = y->begin(); i != x->end(); ++i, ++j) {
+      if (i->first != j->first || !identical(i->second, j->second)) return false;
+    }
+    return true;
+  }
+  return a == b;
+}
+
+}  // namespace
 
 extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size) {
   using kivi::JSONSerialization;
@@ -31,6 +73,8 @@ extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size
   if (!value) {
     check(!strict, "the fragments option refused what reads without it", text);
     check(error->code() == kivi::PropertyListReadCorruptError, "read error code", text);
+    check(!debugDescription(error).starts_with("Invalid JSON text ("),
+          "the careful reader accepts what the fast one refuses", text);
     return 0;
   }
   const bool container =
@@ -38,6 +82,15 @@ extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size
   check(strict.has_value() == container, "fragments option decides only the top level", text);
   check(!strict || *strict == *value, "same value with and without the fragments option", text);
   check(JSONSerialization::isValidJSONObject(*value) == container, "isValidJSONObject", text);
+
+  const std::string careful = "[" + std::string(text) + ",18446744073709551616]";
+  const auto carefulValue = JSONSerialization::JSONObjectWithData(careful, 0, &error);
+  if (carefulValue) {
+    check(identical(*carefulValue->at(0), *value), "both readers read the same value", text);
+  } else {
+    check(debugDescription(error).starts_with("Too deeply nested"),
+          "the careful reader refuses what the fast one accepts", text);
+  }
 
   for (const kivi::JSONWritingOptions options :
        {kivi::JSONWritingFragmentsAllowed,

@@ -3,15 +3,13 @@
 // Reading has two paths. The fast one parses with simdjson's DOM parser (a
 // parser per thread, reused) and converts its tape to Values with an explicit
 // stack. simdjson reports only an error code, so when it refuses a text the
-// careful path, CheckedReader, reads the same text byte by byte to say what
-// is wrong and where. CheckedReader also reads the integers simdjson refuses
-// (beyond 64 bits), which become doubles.
+// careful path reads the same text again with nlohmann::json's SAX parser,
+// which says where it stopped, and turns that into a message with a line and
+// column. The careful path also reads the integers simdjson refuses (beyond
+// 64 bits), which become doubles.
 //
 // Both readers and the writer use explicit stacks: nothing here recurses on
 // the nesting of a document or a Value.
-//
-// Define KIVI_JSON_CROSS_CHECK (fuzzing builds) to run both readers on every
-// text and abort when they disagree.
 #include "kivi/foundation/json_serialization.h"
 
 #include <simdjson.h>
@@ -24,15 +22,11 @@
 #include <cstdio>
 #include <cstring>
 #include <limits>
+#include <nlohmann/json.hpp>
 #include <optional>
 #include <string>
-#include <system_error>
 #include <utility>
 #include <vector>
-
-#ifdef KIVI_JSON_CROSS_CHECK
-#include <cstdlib>
-#endif
 
 #include "kivi/foundation/object.h"
 
@@ -55,467 +49,6 @@ ErrorPtr makeError(std::int64_t code, const char* description, std::string debug
   userInfo.emplace(LocalizedDescriptionKey, Value(description));
   userInfo.emplace(DebugDescriptionErrorKey, Value(std::move(debugDescription)));
   return Error::create(CocoaErrorDomain, code, std::move(userInfo));
-}
-
-bool isOneOf(char c, const char* set) { return c != '\0' && std::strchr(set, c) != nullptr; }
-
-// ---------------------------------------------------------------------------
-// UTF-8
-
-// Length of the well-formed UTF-8 sequence at p (before end), 0 if there is
-// none: no overlong forms, no surrogates, nothing above U+10FFFF.
-std::size_t utf8SequenceLength(const unsigned char* p, const unsigned char* end) {
-  const unsigned char c = p[0];
-  if (c < 0x80) return 1;
-  std::size_t length;
-  unsigned char low = 0x80;
-  unsigned char high = 0xBF;
-  if (c < 0xC2) {
-    return 0;
-  } else if (c < 0xE0) {
-    length = 2;
-  } else if (c < 0xF0) {
-    length = 3;
-    if (c == 0xE0) low = 0xA0;
-    if (c == 0xED) high = 0x9F;
-  } else if (c < 0xF5) {
-    length = 4;
-    if (c == 0xF0) low = 0x90;
-    if (c == 0xF4) high = 0x8F;
-  } else {
-    return 0;
-  }
-  if (static_cast<std::size_t>(end - p) < length) return 0;
-  if (p[1] < low || p[1] > high) return 0;
-  for (std::size_t i = 2; i < length; ++i) {
-    if ((p[i] & 0xC0) != 0x80) return 0;
-  }
-  return length;
-}
-
-void appendUtf8(std::string& out, std::uint32_t codePoint) {
-  if (codePoint < 0x80) {
-    out.push_back(static_cast<char>(codePoint));
-  } else if (codePoint < 0x800) {
-    out.push_back(static_cast<char>(0xC0 | (codePoint >> 6)));
-    out.push_back(static_cast<char>(0x80 | (codePoint & 0x3F)));
-  } else if (codePoint < 0x10000) {
-    out.push_back(static_cast<char>(0xE0 | (codePoint >> 12)));
-    out.push_back(static_cast<char>(0x80 | ((codePoint >> 6) & 0x3F)));
-    out.push_back(static_cast<char>(0x80 | (codePoint & 0x3F)));
-  } else {
-    out.push_back(static_cast<char>(0xF0 | (codePoint >> 18)));
-    out.push_back(static_cast<char>(0x80 | ((codePoint >> 12) & 0x3F)));
-    out.push_back(static_cast<char>(0x80 | ((codePoint >> 6) & 0x3F)));
-    out.push_back(static_cast<char>(0x80 | (codePoint & 0x3F)));
-  }
-}
-
-// ---------------------------------------------------------------------------
-// The careful reader
-
-// Reads JSON text byte by byte with an explicit stack of open containers.
-// On failure message() says what is wrong and where ("... around line L,
-// column C.", both 1-based, the column counted in bytes).
-class CheckedReader {
- public:
-  CheckedReader(std::string_view text, bool fragmentsAllowed)
-      : text_(text), fragmentsAllowed_(fragmentsAllowed) {}
-
-  std::optional<Value> read();
-  const std::string& message() const { return message_; }
-
- private:
-  struct Container {
-    bool isObject;
-    Array array;
-    Dictionary dictionary;
-    std::string key;  // of the member being read, in an object
-  };
-
-  bool atEnd() const { return pos_ >= text_.size(); }
-  unsigned char peek() const { return static_cast<unsigned char>(text_[pos_]); }
-  void skipWhitespace() {
-    while (!atEnd()) {
-      const unsigned char c = peek();
-      if (c != ' ' && c != '\n' && c != '\r' && c != '\t') break;
-      ++pos_;
-    }
-  }
-
-  bool fail(std::string_view what, std::size_t offset);
-  bool failUnexpected(std::size_t offset);  // the character at offset, or the end
-  bool expect(char c);
-
-  bool readScalar(Value& out);
-  bool readLiteral(std::string_view literal);
-  bool readNumber(Value& out);
-  bool readString(std::string& out);
-  bool readEscape(std::string& out);
-  bool readHex4(std::size_t offset, std::uint32_t& out) const;
-
-  std::string_view text_;
-  bool fragmentsAllowed_;
-  std::size_t pos_ = 0;
-  std::string message_;
-};
-
-bool CheckedReader::fail(std::string_view what, std::size_t offset) {
-  std::size_t line = 1;
-  std::size_t lineStart = 0;
-  for (std::size_t i = 0; i < offset && i < text_.size(); ++i) {
-    if (text_[i] == '\n') {
-      ++line;
-      lineStart = i + 1;
-    }
-  }
-  message_.assign(what);
-  message_ += " around line " + std::to_string(line) + ", column " +
-              std::to_string(offset - lineStart + 1) + ".";
-  return false;
-}
-
-bool CheckedReader::failUnexpected(std::size_t offset) {
-  if (offset >= text_.size()) return fail("Unexpected end of input", text_.size());
-  const auto* p = reinterpret_cast<const unsigned char*>(text_.data()) + offset;
-  const auto* end = reinterpret_cast<const unsigned char*>(text_.data()) + text_.size();
-  if (*p >= 0x20 && *p < 0x7F) {
-    return fail(std::string("Unexpected character '") + static_cast<char>(*p) + "'", offset);
-  }
-  if (*p < 0x80) {
-    char name[8];
-    std::snprintf(name, sizeof name, "U+%04X", *p);
-    return fail(std::string("Unexpected character ") + name, offset);
-  }
-  const std::size_t length = utf8SequenceLength(p, end);
-  if (length == 0) return fail("Invalid UTF-8", offset);
-  return fail("Unexpected character '" + std::string(text_.substr(offset, length)) + "'", offset);
-}
-
-bool CheckedReader::expect(char c) {
-  skipWhitespace();
-  if (atEnd() || text_[pos_] != c) return failUnexpected(pos_);
-  ++pos_;
-  return true;
-}
-
-std::optional<Value> CheckedReader::read() {
-  skipWhitespace();
-  if (atEnd()) {
-    fail("Unexpected end of input", text_.size());
-    return std::nullopt;
-  }
-  if (!fragmentsAllowed_ && isOneOf(text_[pos_], "\"-0123456789tfn")) {
-    message_ = kNotAContainer;
-    return std::nullopt;
-  }
-  if (!fragmentsAllowed_ && peek() != '[' && peek() != '{') {
-    failUnexpected(pos_);
-    return std::nullopt;
-  }
-
-  std::vector<Container> stack;
-  Value current;
-  for (;;) {
-    // A value starts here: open a container or read a scalar.
-    skipWhitespace();
-    if (atEnd()) {
-      failUnexpected(pos_);
-      return std::nullopt;
-    }
-    const unsigned char c = peek();
-    bool haveValue = true;
-    if (c == '[' || c == '{') {
-      if (stack.size() == JSONSerialization::kMaxDepth) {
-        fail("Too deeply nested", pos_);
-        return std::nullopt;
-      }
-      ++pos_;
-      stack.push_back(Container{c == '{', {}, {}, {}});
-      skipWhitespace();
-      if (!atEnd() && peek() == (c == '{' ? '}' : ']')) {
-        ++pos_;
-        current = c == '{' ? Value(Dictionary{}) : Value(Array{});
-        stack.pop_back();
-      } else if (c == '{') {
-        skipWhitespace();
-        if (atEnd() || peek() != '"') {
-          failUnexpected(pos_);
-          return std::nullopt;
-        }
-        if (!readString(stack.back().key) || !expect(':')) return std::nullopt;
-        haveValue = false;
-      } else {
-        haveValue = false;
-      }
-    } else if (!readScalar(current)) {
-      return std::nullopt;
-    }
-    if (!haveValue) continue;
-
-    // A value is complete: add it to its container and close the containers
-    // that end here.
-    for (;;) {
-      if (stack.empty()) {
-        skipWhitespace();
-        if (!atEnd()) {
-          failUnexpected(pos_);
-          return std::nullopt;
-        }
-        return current;
-      }
-      Container& top = stack.back();
-      if (top.isObject) {
-        top.dictionary.insert_or_assign(std::move(top.key), std::move(current));
-        top.key.clear();
-      } else {
-        top.array.push_back(std::move(current));
-      }
-      skipWhitespace();
-      if (atEnd()) {
-        failUnexpected(pos_);
-        return std::nullopt;
-      }
-      const unsigned char next = peek();
-      if (next == ',') {
-        ++pos_;
-        if (top.isObject) {
-          skipWhitespace();
-          if (atEnd() || peek() != '"') {
-            failUnexpected(pos_);
-            return std::nullopt;
-          }
-          if (!readString(top.key) || !expect(':')) return std::nullopt;
-        }
-        break;
-      }
-      if (next != (top.isObject ? '}' : ']')) {
-        failUnexpected(pos_);
-        return std::nullopt;
-      }
-      ++pos_;
-      current = top.isObject ? Value(std::move(top.dictionary)) : Value(std::move(top.array));
-      stack.pop_back();
-    }
-  }
-}
-
-bool CheckedReader::readScalar(Value& out) {
-  const unsigned char c = peek();
-  switch (c) {
-    case '"': {
-      std::string s;
-      if (!readString(s)) return false;
-      out = Value(std::move(s));
-      return true;
-    }
-    case 't':
-      out = Value(true);
-      return readLiteral("true");
-    case 'f':
-      out = Value(false);
-      return readLiteral("false");
-    case 'n':
-      out = Value();
-      return readLiteral("null");
-    default:
-      if (c == '-' || (c >= '0' && c <= '9')) return readNumber(out);
-      return failUnexpected(pos_);
-  }
-}
-
-bool CheckedReader::readLiteral(std::string_view literal) {
-  for (char expected : literal) {
-    if (atEnd() || text_[pos_] != expected) return failUnexpected(pos_);
-    ++pos_;
-  }
-  return true;
-}
-
-bool CheckedReader::readNumber(Value& out) {
-  const std::size_t start = pos_;
-  std::size_t end = start;
-  while (end < text_.size() && isOneOf(text_[end], "0123456789+-.eE")) ++end;
-  const std::string_view token = text_.substr(start, end - start);
-  auto invalid = [&](const char* what) {
-    std::string shown(token.substr(0, 40));
-    if (token.size() > 40) shown += "\u2026";
-    return fail(std::string(what) + " '" + shown + "'", start);
-  };
-  auto isDigit = [&](std::size_t i) {
-    return i < token.size() && token[i] >= '0' && token[i] <= '9';
-  };
-
-  std::size_t i = 0;
-  const bool negative = token[0] == '-';
-  if (negative) ++i;
-  const std::size_t integerStart = i;
-  if (!isDigit(i)) return invalid("Invalid number");
-  if (token[i] == '0') {
-    ++i;
-  } else {
-    while (isDigit(i)) ++i;
-  }
-  const std::size_t integerEnd = i;
-  bool integral = true;
-  if (i < token.size() && token[i] == '.') {
-    integral = false;
-    ++i;
-    if (!isDigit(i)) return invalid("Invalid number");
-    while (isDigit(i)) ++i;
-  }
-  const std::size_t fractionEnd = i;
-  std::int64_t exponent = 0;
-  if (i < token.size() && (token[i] == 'e' || token[i] == 'E')) {
-    integral = false;
-    ++i;
-    bool negativeExponent = false;
-    if (i < token.size() && (token[i] == '+' || token[i] == '-'))
-      negativeExponent = token[i++] == '-';
-    if (!isDigit(i)) return invalid("Invalid number");
-    while (isDigit(i)) {
-      if (exponent < 1'000'000'000) exponent = exponent * 10 + (token[i] - '0');
-      ++i;
-    }
-    if (negativeExponent) exponent = -exponent;
-  }
-  if (i != token.size()) return invalid("Invalid number");
-  pos_ = end;
-
-  if (integral) {
-    std::uint64_t magnitude = 0;
-    bool overflow = false;
-    for (std::size_t k = integerStart; k < integerEnd; ++k) {
-      const auto digit = static_cast<std::uint64_t>(token[k] - '0');
-      if (magnitude > (std::numeric_limits<std::uint64_t>::max() - digit) / 10) {
-        overflow = true;
-        break;
-      }
-      magnitude = magnitude * 10 + digit;
-    }
-    constexpr auto kInt64Max = static_cast<std::uint64_t>(std::numeric_limits<std::int64_t>::max());
-    if (!overflow && !negative) {
-      out = magnitude <= kInt64Max ? Value(Number(static_cast<std::int64_t>(magnitude)))
-                                   : Value(Number(magnitude));
-      return true;
-    }
-    if (!overflow && magnitude <= kInt64Max + 1) {
-      out = Value(Number(magnitude == kInt64Max + 1 ? std::numeric_limits<std::int64_t>::min()
-                                                    : -static_cast<std::int64_t>(magnitude)));
-      return true;
-    }
-  }
-
-  double d = 0;
-  const auto result = std::from_chars(token.data(), token.data() + token.size(), d);
-  if (result.ec == std::errc::result_out_of_range) {
-    // Too large or too small for a double: find which from the position of
-    // the first significant digit.
-    std::int64_t magnitude = 0;
-    std::size_t k = integerStart;
-    while (k < fractionEnd && (token[k] == '0' || token[k] == '.')) ++k;
-    if (k < integerEnd) {
-      magnitude = static_cast<std::int64_t>(integerEnd - k) - 1;
-    } else {
-      magnitude = -static_cast<std::int64_t>(k - integerEnd);  // counts the '.'
-    }
-    if (magnitude + exponent > 0) return invalid("Number out of range");
-    d = negative ? -0.0 : 0.0;
-  } else if (result.ec != std::errc() || !std::isfinite(d)) {
-    return invalid("Number out of range");
-  }
-  out = Value(Number(d));
-  return true;
-}
-
-bool CheckedReader::readString(std::string& out) {
-  out.clear();
-  ++pos_;  // the opening quote
-  const auto* base = reinterpret_cast<const unsigned char*>(text_.data());
-  const auto* end = base + text_.size();
-  for (;;) {
-    if (atEnd()) return fail("Unexpected end of input", text_.size());
-    const unsigned char c = peek();
-    if (c == '"') {
-      ++pos_;
-      return true;
-    }
-    if (c == '\\') {
-      if (!readEscape(out)) return false;
-    } else if (c < 0x20) {
-      char name[8];
-      std::snprintf(name, sizeof name, "U+%04X", c);
-      return fail(std::string("Unescaped control character ") + name + " in string", pos_);
-    } else if (c < 0x80) {
-      out.push_back(static_cast<char>(c));
-      ++pos_;
-    } else {
-      const std::size_t length = utf8SequenceLength(base + pos_, end);
-      if (length == 0) return fail("Invalid UTF-8", pos_);
-      out.append(text_.data() + pos_, length);
-      pos_ += length;
-    }
-  }
-}
-
-bool CheckedReader::readHex4(std::size_t offset, std::uint32_t& out) const {
-  if (text_.size() - offset < 4) return false;
-  out = 0;
-  for (std::size_t i = 0; i < 4; ++i) {
-    const char h = text_[offset + i];
-    std::uint32_t digit;
-    if (h >= '0' && h <= '9') {
-      digit = static_cast<std::uint32_t>(h - '0');
-    } else if (h >= 'a' && h <= 'f') {
-      digit = static_cast<std::uint32_t>(h - 'a' + 10);
-    } else if (h >= 'A' && h <= 'F') {
-      digit = static_cast<std::uint32_t>(h - 'A' + 10);
-    } else {
-      return false;
-    }
-    out = out << 4 | digit;
-  }
-  return true;
-}
-
-bool CheckedReader::readEscape(std::string& out) {
-  const std::size_t start = pos_;  // the backslash
-  if (start + 1 >= text_.size()) return fail("Unexpected end of input", text_.size());
-  const char kind = text_[start + 1];
-  const char* simple = std::strchr("\"\\/bfnrt", kind);
-  if (kind != '\0' && simple != nullptr) {
-    static constexpr char kDecoded[] = "\"\\/\b\f\n\r\t";
-    out.push_back(kDecoded[simple - "\"\\/bfnrt"]);
-    pos_ += 2;
-    return true;
-  }
-  if (kind != 'u') {
-    const auto* p = reinterpret_cast<const unsigned char*>(text_.data()) + start + 1;
-    if (*p < 0x20 || *p >= 0x7F) return failUnexpected(start + 1);
-    return fail(std::string("Invalid escape sequence '\\") + kind + "'", start);
-  }
-  auto shown = [&](std::size_t offset) {
-    return std::string(text_.substr(offset, std::min<std::size_t>(6, text_.size() - offset)));
-  };
-  std::uint32_t codePoint;
-  if (!readHex4(start + 2, codePoint)) {
-    return fail("Invalid unicode escape '" + shown(start) + "'", start);
-  }
-  pos_ = start + 6;
-  if (codePoint >= 0xDC00 && codePoint <= 0xDFFF) {
-    return fail("Unpaired surrogate '" + shown(start) + "'", start);
-  }
-  if (codePoint >= 0xD800 && codePoint <= 0xDBFF) {
-    std::uint32_t low;
-    if (text_.size() - pos_ < 6 || text_[pos_] != '\\' || text_[pos_ + 1] != 'u' ||
-        !readHex4(pos_ + 2, low) || low < 0xDC00 || low > 0xDFFF) {
-      return fail("Unpaired surrogate '" + shown(start) + "'", start);
-    }
-    codePoint = 0x10000 + ((codePoint - 0xD800) << 10) + (low - 0xDC00);
-    pos_ += 6;
-  }
-  appendUtf8(out, codePoint);
-  return true;
 }
 
 // ---------------------------------------------------------------------------
@@ -648,41 +181,257 @@ class TapeConverter {
   std::vector<Frame> stack_;
 };
 
-#ifdef KIVI_JSON_CROSS_CHECK
-// Equal including the number flavours and the sign of zero.
-bool identical(const Value& a, const Value& b) {
-  if (a.kind() != b.kind()) return false;
-  if (const Number* n = a.asNumber()) {
-    const Number* m = b.asNumber();
-    if (n->type() != m->type() || !(*n == *m)) return false;
-    return n->type() != Number::Type::Double ||
-           std::signbit(n->doubleValue()) == std::signbit(m->doubleValue());
-  }
-  if (const Array* x = a.asArray()) {
-    const Array* y = b.asArray();
-    if (x->size() != y->size()) return false;
-    for (std::size_t i = 0; i < x->size(); ++i) {
-      if (!identical((*x)[i], (*y)[i])) return false;
-    }
-    return true;
-  }
-  if (const Dictionary* x = a.asDictionary()) {
-    const Dictionary* y = b.asDictionary();
-    if (x->size() != y->size()) return false;
-    for (auto i = x->begin(), j = y->begin(); i != x->end(); ++i, ++j) {
-      if (i->first != j->first || !identical(i->second, j->second)) return false;
-    }
-    return true;
-  }
-  return a == b;
+// ---------------------------------------------------------------------------
+// The careful reader
+
+bool isDigit(char c) { return c >= '0' && c <= '9'; }
+bool isNumberChar(char c) {
+  return isDigit(c) || c == '-' || c == '+' || c == '.' || c == 'e' || c == 'E';
+}
+std::string codePointName(unsigned char c) {
+  char name[8];
+  std::snprintf(name, sizeof name, "U+%04X", c);
+  return name;
 }
 
-[[noreturn]] void readersDisagree(std::string_view text, const char* what) {
-  std::fprintf(stderr, "JSON readers disagree (%s) on %zu bytes:\n%.*s\n", what, text.size(),
-               static_cast<int>(std::min<std::size_t>(text.size(), 4096)), text.data());
-  std::abort();
+// "<what> around line L, column C." for the byte at `offset`: both 1-based,
+// the column counted in bytes.
+std::string located(std::string_view text, std::string_view what, std::size_t offset) {
+  const std::string_view before = text.substr(0, offset);
+  const std::size_t newline = before.rfind('\n');
+  const std::size_t column = offset - (newline == std::string_view::npos ? 0 : newline + 1) + 1;
+  return std::string(what) + " around line " +
+         std::to_string(1 + std::count(before.begin(), before.end(), '\n')) + ", column " +
+         std::to_string(column) + ".";
 }
-#endif
+
+// The character at `offset` (or the end of the text) where it cannot be.
+std::string unexpected(std::string_view text, std::size_t offset) {
+  if (offset >= text.size()) return located(text, "Unexpected end of input", text.size());
+  const auto c = static_cast<unsigned char>(text[offset]);
+  if (c >= 0x20 && c < 0x7F) {
+    return located(text, std::string("Unexpected character '") + static_cast<char>(c) + "'",
+                   offset);
+  }
+  if (c < 0x80) return located(text, "Unexpected character " + codePointName(c), offset);
+  const std::size_t length = c >= 0xF0 ? 4 : c >= 0xE0 ? 3 : 2;
+  if (text.size() - offset < length || !simdjson::validate_utf8(text.data() + offset, length)) {
+    return located(text, "Invalid UTF-8", offset);
+  }
+  return located(text, "Unexpected character '" + std::string(text.substr(offset, length)) + "'",
+                 offset);
+}
+
+// The run of number characters around `offset`, which is not a number (or
+// not one a double can hold).
+std::string badNumber(std::string_view text, std::string_view what, std::size_t offset) {
+  std::size_t start = offset;
+  while (start > 0 && isNumberChar(text[start - 1])) --start;
+  while (start < offset && text[start] != '-' && !isDigit(text[start])) ++start;
+  std::size_t end = start;
+  while (end < text.size() && isNumberChar(text[end])) ++end;
+  std::string shown(text.substr(start, std::min<std::size_t>(end - start, 40)));
+  if (end - start > 40) shown += "\u2026";
+  return located(text, std::string(what) + " '" + shown + "'", start);
+}
+
+// Where the UTF-8 sequence broken at `offset` starts: there, or at the lead
+// byte of the sequence that byte should have continued.
+std::size_t sequenceStart(std::string_view text, std::size_t offset) {
+  std::size_t lead = offset;
+  while (lead > 0 && offset - lead < 3 &&
+         (static_cast<unsigned char>(text[lead - 1]) & 0xC0) == 0x80)
+    --lead;
+  if (lead == 0) return offset;
+  const auto c = static_cast<unsigned char>(text[--lead]);
+  const std::size_t length = c >= 0xF0 ? 4 : c >= 0xE0 ? 3 : c >= 0xC0 ? 2 : 0;
+  return length > offset - lead ? lead : offset;
+}
+
+// The offset of the bracket that opens level kMaxDepth + 1, in a text that
+// is valid up to there.
+std::size_t tooDeepOffset(std::string_view text) {
+  std::size_t depth = 0;
+  bool inString = false;
+  for (std::size_t i = 0; i < text.size(); ++i) {
+    const char c = text[i];
+    if (inString) {
+      if (c == '\\') {
+        ++i;
+      } else if (c == '"') {
+        inString = false;
+      }
+    } else if (c == '"') {
+      inString = true;
+    } else if (c == '[' || c == '{') {
+      if (++depth > JSONSerialization::kMaxDepth) return i;
+    } else if (c == ']' || c == '}') {
+      --depth;
+    }
+  }
+  return text.size();
+}
+
+// Says what is wrong with `text` and where, from what nlohmann's parser
+// reports: `position` counts the bytes it read, the last one being where it
+// stopped (one more than the text when it ran out); its exception's message
+// names a problem within a token before "; last read: ", otherwise the token
+// that cannot be where it is.
+std::string describeFailure(std::string_view text, std::size_t position, std::string_view lastToken,
+                            const nlohmann::json::exception& e) {
+  std::size_t at = position == 0 ? 0 : position - 1;
+  if (at >= text.size()) return located(text, "Unexpected end of input", text.size());
+  const std::string_view what = e.what();
+  if (e.id == 406) return badNumber(text, "Number out of range", at);  // at: its last digit
+  const std::size_t lastRead = what.find("; last read: ");
+  auto says = [&](std::string_view words) {
+    return lastRead != std::string_view::npos &&
+           what.substr(0, lastRead).find(words) != std::string_view::npos;
+  };
+  auto escape = [&](std::string_view problem, std::size_t start) {
+    start = std::min(start, at);  // never past where the reader stopped
+    return located(text, std::string(problem) + " '" + std::string(text.substr(start, 6)) + "'",
+                   start);
+  };
+  if (lastRead == std::string_view::npos) {
+    // A whole token where it cannot be: point at its start. nlohmann keeps
+    // the text of strings and numbers only; the others are literals or a
+    // single byte.
+    const char last = text[at];
+    std::size_t length = 1;
+    if (last == '"' || isDigit(last)) {
+      length = lastToken.size();
+    } else if (last == 'l' || last == 'e') {
+      length = text.substr(0, at + 1).ends_with("false") ? 5 : 4;
+    }
+    at = at + 1 - std::min(length, at + 1);
+  } else if (says("must follow U+D800")) {  // a low surrogate alone: at its last digit
+    return escape("Unpaired surrogate", at - 5);
+  } else if (says("must be followed by U+DC00")) {  // a high one without a low one after it
+    return escape("Unpaired surrogate", text.rfind("\\u", at - 6));
+  } else if (says("4 hex digits")) {
+    return escape("Invalid unicode escape", text.rfind("\\u", at - 2));
+  } else if (says("after backslash")) {
+    const auto c = static_cast<unsigned char>(text[at]);
+    if (c < 0x20 || c >= 0x7F) return unexpected(text, at);
+    return located(text, std::string("Invalid escape sequence '\\") + text[at] + "'", at - 1);
+  } else if (says("control character")) {
+    const auto c = static_cast<unsigned char>(text[at]);
+    return located(text, "Unescaped control character " + codePointName(c) + " in string", at);
+  } else if (says("UTF-8")) {
+    return located(text, "Invalid UTF-8", sequenceStart(text, at));
+  } else if (says("invalid number")) {
+    return badNumber(text, "Invalid number", at);
+  }
+  // Right after the digits of a number, a number character makes that number
+  // invalid: 01, 1.5.2, 1-2.
+  if (at > 0 && isDigit(text[at - 1]) && isNumberChar(text[at])) {
+    return badNumber(text, "Invalid number", at);
+  }
+  return unexpected(text, at);
+}
+
+// Builds a Value from nlohmann's SAX events, with an explicit stack of open
+// containers; on failure message() says what is wrong and where.
+class ValueBuilder {
+ public:
+  explicit ValueBuilder(std::string_view text) : text_(text) {}
+
+  Value& value() { return value_; }
+  std::string& message() { return message_; }
+
+  bool null() { return add(Value()); }
+  bool boolean(bool b) { return add(Value(b)); }
+  bool number_integer(std::int64_t i) { return add(Value(Number(i))); }
+  bool number_unsigned(std::uint64_t u) {
+    constexpr auto kInt64Max = static_cast<std::uint64_t>(std::numeric_limits<std::int64_t>::max());
+    return add(u <= kInt64Max ? Value(Number(static_cast<std::int64_t>(u))) : Value(Number(u)));
+  }
+  bool number_float(double d, const std::string&) { return add(Value(Number(d))); }
+  bool string(std::string& s) { return add(Value(std::move(s))); }
+  bool binary(nlohmann::json::binary_t&) { return false; }  // never in JSON text
+  bool start_object(std::size_t) { return open(true); }
+  bool start_array(std::size_t) { return open(false); }
+  bool key(std::string& key) {
+    stack_.back().key = std::move(key);
+    return true;
+  }
+  bool end_object() { return close(); }
+  bool end_array() { return close(); }
+  bool parse_error(std::size_t position, const std::string& lastToken,
+                   const nlohmann::json::exception& e) {
+    message_ = describeFailure(text_, position, lastToken, e);
+    return false;
+  }
+
+ private:
+  struct Container {
+    bool isObject;
+    Array array;
+    Dictionary dictionary;
+    std::string key;  // of the member being read, in an object
+  };
+
+  bool open(bool isObject) {
+    if (stack_.size() == JSONSerialization::kMaxDepth) {
+      message_ = located(text_, "Too deeply nested", tooDeepOffset(text_));
+      return false;
+    }
+    stack_.push_back(Container{isObject, {}, {}, {}});
+    return true;
+  }
+  bool close() {
+    Container& top = stack_.back();
+    Value done = top.isObject ? Value(std::move(top.dictionary)) : Value(std::move(top.array));
+    stack_.pop_back();
+    return add(std::move(done));
+  }
+  bool add(Value value) {
+    if (stack_.empty()) {
+      value_ = std::move(value);
+    } else if (Container& top = stack_.back(); top.isObject) {
+      top.dictionary.insert_or_assign(std::move(top.key), std::move(value));  // the last one wins
+    } else {
+      top.array.push_back(std::move(value));
+    }
+    return true;
+  }
+
+  std::string_view text_;
+  std::vector<Container> stack_;
+  Value value_;
+  std::string message_;
+};
+
+// Reads `text` with nlohmann's parser: the value, or none and `message`
+// saying what is wrong and where. Cold: kept from crowding the fast path's
+// inlining.
+[[gnu::cold]] std::optional<Value> readCarefully(std::string_view text, bool fragmentsAllowed,
+                                                 std::string& message) {
+  const std::size_t first = text.find_first_not_of(" \t\n\r");
+  if (!fragmentsAllowed && first != std::string_view::npos &&
+      std::string_view("\"-0123456789tfn").find(text[first]) != std::string_view::npos) {
+    message = kNotAContainer;
+    return std::nullopt;
+  }
+  // nlohmann skips a byte order mark; the fast reader refuses one, and so does this one.
+  if (text.starts_with('\xEF')) {
+    message = unexpected(text, 0);
+    return std::nullopt;
+  }
+  ValueBuilder builder(text);
+  if (!nlohmann::json::sax_parse(text.begin(), text.end(), &builder)) {
+    message = std::move(builder.message());
+    return std::nullopt;
+  }
+  // nlohmann takes a NUL byte for the end of the text: one it accepted is
+  // after the value.
+  if (const std::size_t nul = text.find('\0'); nul != std::string_view::npos) {
+    message = unexpected(text, nul);
+    return std::nullopt;
+  }
+  return std::move(builder.value());
+}
 
 // ---------------------------------------------------------------------------
 // The writer
@@ -1007,22 +756,7 @@ std::optional<Value> JSONSerialization::JSONObjectWithData(std::string_view data
   simdjson::dom::element root;
   if (code == simdjson::SUCCESS) code = parser->parse(data.data(), data.size()).get(root);
   Value value;
-  const bool converted = code == simdjson::SUCCESS && TapeConverter().convert(root, value);
-
-#ifdef KIVI_JSON_CROSS_CHECK
-  {
-    CheckedReader checked(data, true);
-    const std::optional<Value> careful = checked.read();
-    if (converted) {
-      if (!careful) readersDisagree(data, checked.message().c_str());
-      if (!identical(*careful, value)) readersDisagree(data, "values");
-    } else if (careful && code != simdjson::NUMBER_ERROR && code != simdjson::CAPACITY) {
-      readersDisagree(data, simdjson::error_message(code));
-    }
-  }
-#endif
-
-  if (converted) {
+  if (code == simdjson::SUCCESS && TapeConverter().convert(root, value)) {
     if (!fragmentsAllowed && value.kind() != Value::Kind::Array &&
         value.kind() != Value::Kind::Dictionary) {
       return refuse(kNotAContainer);
@@ -1032,12 +766,12 @@ std::optional<Value> JSONSerialization::JSONObjectWithData(std::string_view data
   }
   if (code == simdjson::MEMALLOC) return refuse("Not enough memory to read the JSON text.");
 
-  // Read again with the careful reader to find what is wrong and where. It
+  // Read again carefully to find what is wrong and where. The careful reader
   // accepts what simdjson refuses only for numbers (integers beyond 64 bits)
   // and sizes (beyond 4 GB).
-  CheckedReader checked(data, fragmentsAllowed);
-  std::optional<Value> careful = checked.read();
-  if (!careful) return refuse(checked.message());
+  std::string message;
+  std::optional<Value> careful = readCarefully(data, fragmentsAllowed, message);
+  if (!careful) return refuse(std::move(message));
   if (code != simdjson::NUMBER_ERROR && code != simdjson::CAPACITY) {
     return refuse(std::string("Invalid JSON text (") + simdjson::error_message(code) + ").");
   }

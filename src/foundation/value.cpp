@@ -4,6 +4,9 @@
 #include <cstdio>
 #include <cstdlib>
 #include <limits>
+#include <tuple>
+#include <utility>
+#include <vector>
 
 #include "kivi/foundation/object.h"
 #include "kivi/foundation/url.h"
@@ -127,29 +130,89 @@ const Value* Value::at(std::size_t index) const noexcept {
   return a && index < a->size() ? &(*a)[index] : nullptr;
 }
 
-bool operator==(const Value& a, const Value& b) noexcept {
-  if (a.kind() != b.kind()) return false;
-  switch (a.kind()) {
-    case Value::Kind::Null:
-      return true;
-    case Value::Kind::Number:
-      return *a.asNumber() == *b.asNumber();
-    case Value::Kind::String:
-      return *a.asString() == *b.asString();
-    case Value::Kind::Data:
-      return *a.asData() == *b.asData();
-    case Value::Kind::Date:
-      return *a.asDate() == *b.asDate();
-    case Value::Kind::URL:
-      return *a.asURL() == *b.asURL();
-    case Value::Kind::Array:
-      return a.asArray() == b.asArray() || *a.asArray() == *b.asArray();
-    case Value::Kind::Dictionary:
-      return a.asDictionary() == b.asDictionary() || *a.asDictionary() == *b.asDictionary();
-    case Value::Kind::Object:
-      return *a.asObject() == *b.asObject();
+void Value::releaseCollection() noexcept {
+  // Collections released while another one is (by the destruction of its
+  // elements) wait in `pending` for the loop below, so that nesting never
+  // deepens the stack.
+  thread_local std::vector<std::shared_ptr<const void>>* pending = nullptr;
+  std::shared_ptr<const void> collection;
+  if (auto* array = std::get_if<std::shared_ptr<const Array>>(&v_)) {
+    collection = std::move(*array);
+  } else {
+    collection = std::move(*std::get_if<std::shared_ptr<const Dictionary>>(&v_));
   }
-  return false;
+  if (pending != nullptr) {
+    try {
+      pending->push_back(std::move(collection));
+    } catch (...) {  // out of memory: released here instead, recursively
+    }
+    return;
+  }
+  std::vector<std::shared_ptr<const void>> waiting;
+  pending = &waiting;
+  collection.reset();
+  while (!waiting.empty()) {
+    std::shared_ptr<const void> next = std::move(waiting.back());
+    waiting.pop_back();
+    next.reset();
+  }
+  pending = nullptr;
+}
+
+bool operator==(const Value& a, const Value& b) noexcept {
+  // Pairs of collection elements still to compare.
+  std::vector<std::pair<const Value*, const Value*>> pending;
+  const Value* x = &a;
+  const Value* y = &b;
+  for (;;) {
+    if (x->kind() != y->kind()) return false;
+    bool equal = true;
+    switch (x->kind()) {
+      case Value::Kind::Null:
+        break;
+      case Value::Kind::Number:
+        equal = *x->asNumber() == *y->asNumber();
+        break;
+      case Value::Kind::String:
+        equal = *x->asString() == *y->asString();
+        break;
+      case Value::Kind::Data:
+        equal = *x->asData() == *y->asData();
+        break;
+      case Value::Kind::Date:
+        equal = *x->asDate() == *y->asDate();
+        break;
+      case Value::Kind::URL:
+        equal = *x->asURL() == *y->asURL();
+        break;
+      case Value::Kind::Array: {
+        const Array* p = x->asArray();
+        const Array* q = y->asArray();
+        if (p == q) break;
+        if (!p || !q || p->size() != q->size()) return false;  // (null: moved from)
+        for (std::size_t i = p->size(); i-- > 0;) pending.emplace_back(&(*p)[i], &(*q)[i]);
+        break;
+      }
+      case Value::Kind::Dictionary: {
+        const Dictionary* p = x->asDictionary();
+        const Dictionary* q = y->asDictionary();
+        if (p == q) break;
+        if (!p || !q || p->size() != q->size()) return false;  // (null: moved from)
+        for (auto i = p->begin(), j = q->begin(); i != p->end(); ++i, ++j) {
+          if (i->first != j->first) return false;
+          pending.emplace_back(&i->second, &j->second);
+        }
+        break;
+      }
+      case Value::Kind::Object:
+        equal = *x->asObject() == *y->asObject();
+        break;
+    }
+    if (!equal) return false;
+    if (pending.empty()) return true;
+    std::tie(x, y) = pending.back();
+    pending.pop_back();
+  }
 }
 
 namespace {
@@ -163,7 +226,8 @@ void appendQuoted(std::string& out, const std::string& s) {
   out += '"';
 }
 
-void describe(const Value& v, std::string& out) {
+// Describes a value that is not a collection.
+void describeScalar(const Value& v, std::string& out) {
   switch (v.kind()) {
     case Value::Kind::Null:
       out += "<null>";
@@ -195,32 +259,11 @@ void describe(const Value& v, std::string& out) {
     case Value::Kind::URL:
       out += v.asURL()->absoluteString();
       return;
-    case Value::Kind::Array: {
-      out += '(';
-      bool first = true;
-      for (const Value& e : *v.asArray()) {
-        out += first ? "" : ", ";
-        first = false;
-        describe(e, out);
-      }
-      out += ')';
-      return;
-    }
-    case Value::Kind::Dictionary: {
-      out += '{';
-      bool first = true;
-      for (const auto& [k, e] : *v.asDictionary()) {
-        out += first ? "" : "; ";
-        first = false;
-        appendQuoted(out, k);
-        out += " = ";
-        describe(e, out);
-      }
-      out += '}';
-      return;
-    }
     case Value::Kind::Object:
       out += (*v.asObject())->description();
+      return;
+    case Value::Kind::Array:
+    case Value::Kind::Dictionary:
       return;
   }
 }
@@ -228,9 +271,43 @@ void describe(const Value& v, std::string& out) {
 }  // namespace
 
 std::string Value::description() const {
+  // The collections being described, innermost last.
+  struct Frame {
+    const Array* array;
+    std::size_t index;
+    Dictionary::const_iterator member, end;
+  };
+  std::vector<Frame> stack;
   std::string out;
-  describe(*this, out);
-  return out;
+  const Value* next = this;
+  for (;;) {
+    if (next != nullptr) {
+      if (const Array* array = next->asArray()) {
+        out += '(';
+        stack.push_back(Frame{array, 0, {}, {}});
+      } else if (const Dictionary* dictionary = next->asDictionary()) {
+        out += '{';
+        stack.push_back(Frame{nullptr, 0, dictionary->begin(), dictionary->end()});
+      } else {
+        describeScalar(*next, out);
+      }
+      next = nullptr;
+    }
+    if (stack.empty()) return out;
+    Frame& f = stack.back();
+    if (f.array != nullptr && f.index < f.array->size()) {
+      if (f.index != 0) out += ", ";
+      next = &(*f.array)[f.index++];
+    } else if (f.array == nullptr && f.member != f.end) {
+      if (f.index++ != 0) out += "; ";
+      appendQuoted(out, f.member->first);
+      out += " = ";
+      next = &(f.member++)->second;
+    } else {
+      out += f.array != nullptr ? ')' : '}';
+      stack.pop_back();
+    }
+  }
 }
 
 }  // namespace kivi

@@ -2,12 +2,15 @@
 //
 // A valid JSON object (isValidJSONObject) is an array or dictionary at the
 // top level whose members are, all the way down, arrays, dictionaries,
-// strings, numbers that are neither NaN nor infinite, and the null marker.
+// strings, numbers that are neither NaN nor infinite, and the null marker,
+// nested at most kMaxDepth levels deep.
 //
 // Reading gives dictionaries, arrays, strings (valid UTF-8 only), the null
 // marker and numbers: true/false as Bool numbers, integers that fit as Int
-// (UInt above INT64_MAX), everything else as Double. A document nested deeper
-// than kMaxDepth is refused with an error, never a stack overflow.
+// (UInt above INT64_MAX), everything else as Double (integers beyond 64 bits
+// too). A document nested deeper than kMaxDepth is refused with an error,
+// never a stack overflow; so is writing a Value nested deeper than that (it
+// could not be read back).
 //
 //   kivi::ErrorPtr error;
 //   auto value = kivi::JSONSerialization::JSONObjectWithData(bytes, 0, &error);
@@ -55,10 +58,10 @@ class JSONSerialization {
 
   // Null and *error set when `value` is not valid JSON (with
   // JSONWritingFragmentsAllowed a lone string, number or null marker is
-  // allowed at the top level). Pretty printing indents by two spaces and
-  // writes "key" : value; "/" is written "\/" unless
-  // JSONWritingWithoutEscapingSlashes. `error` may be null; when given it is
-  // written on every call.
+  // allowed at the top level) or nested deeper than kMaxDepth. Pretty
+  // printing indents by two spaces and writes "key" : value; "/" is written
+  // "\/" unless JSONWritingWithoutEscapingSlashes. `error` may be null; when
+  // given it is written on every call.
   static std::optional<Data> dataWithJSONObject(const Value& value, JSONWritingOptions options,
                                                 ErrorPtr* error);
 

@@ -115,6 +115,16 @@ class Value {
   };
 
   Value() noexcept = default;
+  Value(const Value&) = default;
+  Value(Value&&) noexcept = default;
+  Value& operator=(const Value&) = default;
+  Value& operator=(Value&&) noexcept = default;
+  // Releases nested collections one after another, never recursively: a
+  // Value nested a million levels deep is dropped like a flat one.
+  ~Value() {
+    if (holdsCollection()) releaseCollection();
+  }
+
   Value(std::nullptr_t) noexcept {}
   Value(Null) noexcept {}
   Value(Number n) noexcept : v_(n) {}
@@ -173,13 +183,22 @@ class Value {
   const Value* at(std::size_t index) const noexcept;
 
   // Equality as the platform's isEqual: numbers by value, URLs by text,
-  // collections element-wise, objects by identity.
+  // collections element-wise, objects by identity. Like description(), it
+  // walks nested collections with a stack of its own, not recursion.
   friend bool operator==(const Value& a, const Value& b) noexcept;
 
   // A readable rendering for logs and diagnostics (not JSON).
   std::string description() const;
 
  private:
+  // An array or dictionary, not just the moved-from husk of one.
+  bool holdsCollection() const noexcept {
+    if (auto* array = std::get_if<std::shared_ptr<const Array>>(&v_)) return *array != nullptr;
+    auto* dictionary = std::get_if<std::shared_ptr<const Dictionary>>(&v_);
+    return dictionary != nullptr && *dictionary != nullptr;
+  }
+  void releaseCollection() noexcept;
+
   std::variant<Null, Number, std::string, Data, Date, URLPtr, std::shared_ptr<const Array>,
                std::shared_ptr<const Dictionary>, std::shared_ptr<Object>>
       v_;
