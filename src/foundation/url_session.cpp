@@ -2,10 +2,14 @@
 
 #include <curl/curl.h>
 #include <simdjson.h>
+#include <sys/epoll.h>
+#include <sys/eventfd.h>
+#include <sys/timerfd.h>
+#include <unistd.h>
 
 #include <algorithm>
+#include <cerrno>
 #include <chrono>
-#include <deque>
 #include <thread>
 #include <unordered_map>
 #include <vector>
@@ -160,7 +164,9 @@ std::string versionText(long version) {
 
 }  // namespace
 
-// One running request.
+// One request, from resume() until its completion is handed to the delegate
+// queue. While the transfer is in the multi handle, libcurl's callbacks write
+// to it under URLSessionCore::mutex.
 struct Transfer {
   URLSessionTaskPtr task;
   URLSession::DataTaskCompletionHandler completion;
@@ -184,35 +190,41 @@ struct Transfer {
   }
 };
 
+// A transfer taken out of the multi handle: libcurl's result, or the session's
+// own verdict (cancelled, timed out) when `code` is not 0.
+struct Ended {
+  std::unique_ptr<Transfer> transfer;
+  CURLcode result = CURLE_OK;
+  std::int64_t code = 0;
+};
+
+// The multi handle is driven by whichever thread has something to do: resume()
+// adds the transfer and sends the request on the calling thread, cancel()
+// takes it out on its thread, and the session's network thread sleeps in
+// epoll_wait until a socket is ready or a deadline passes (a timerfd). No
+// thread ever has to wake another to get a request sent.
 struct URLSessionCore : std::enable_shared_from_this<URLSessionCore> {
-  URLSessionCore(URLSessionConfiguration configuration, std::shared_ptr<OperationQueue> queue)
-      : configuration(std::move(configuration)), delegateQueue(std::move(queue)) {
-    initializeCurlOnce();
-    multi = curl_multi_init();
-    curl_multi_setopt(multi, CURLMOPT_PIPELINING, CURLPIPE_MULTIPLEX);
-    curl_multi_setopt(multi, CURLMOPT_MAX_HOST_CONNECTIONS,
-                      static_cast<long>(std::max<std::int64_t>(
-                          0, this->configuration.HTTPMaximumConnectionsPerHost)));
-  }
-  ~URLSessionCore() {
-    for (auto& [easy, transfer] : active) curl_multi_remove_handle(multi, easy);
-    active.clear();
-    curl_multi_cleanup(multi);
-  }
+  URLSessionCore(URLSessionConfiguration configuration, std::shared_ptr<OperationQueue> queue);
+  ~URLSessionCore();
 
   const URLSessionConfiguration configuration;
   const std::shared_ptr<OperationQueue> delegateQueue;
-  CURLM* multi = nullptr;
 
+  // Guards everything below. Every call into `multi` is made holding it, so
+  // libcurl's callbacks run under it too.
   std::mutex mutex;
-  std::deque<std::unique_ptr<Transfer>> incoming;  // guarded by mutex
-  std::vector<std::uint64_t> cancelRequests;       // guarded by mutex
-  bool invalidated = false;                        // guarded by mutex
-  bool cancelEverything = false;                   // guarded by mutex
-  bool threadRunning = false;                      // guarded by mutex
-
-  // Owned by the network thread.
-  std::unordered_map<CURL*, std::unique_ptr<Transfer>> active;
+  CURLM* multi = nullptr;
+  int epollFd = -1;  // the transfers' sockets, timerFd and wakeFd
+  int timerFd = -1;  // fires at `armed`
+  int wakeFd = -1;   // an eventfd: the network thread should see whether to stop
+  std::unordered_map<std::uint64_t, std::unique_ptr<Transfer>> active;  // by task identifier
+  std::vector<Ended> ended;  // completed once the lock is released
+  bool invalidated = false;
+  bool threadRunning = false;
+  bool timeoutNow = false;  // libcurl asked to be driven again at once
+  Clock::time_point curlDeadline = Clock::time_point::max();
+  Clock::time_point idleCheck = Clock::time_point::max();  // no transfer goes idle before
+  Clock::time_point armed = Clock::time_point::max();
 
   void submit(std::unique_ptr<Transfer> transfer);
   void requestCancel(std::uint64_t taskIdentifier);
@@ -221,7 +233,15 @@ struct URLSessionCore : std::enable_shared_from_this<URLSessionCore> {
   bool configure(Transfer& transfer);
   void complete(std::unique_ptr<Transfer> transfer, std::optional<Data> data,
                 HTTPURLResponsePtr response, ErrorPtr error);
-  void finish(std::unique_ptr<Transfer> transfer, CURLcode result);
+  void finish(Ended ended);
+
+  // Runs `work` under the lock, then completes what it ended.
+  template <class Work>
+  void withLock(Work&& work);
+  void driveLocked(curl_socket_t socket, int events);
+  void endLocked(std::uint64_t taskIdentifier, CURLcode result, std::int64_t code);
+  void expireIdleLocked(Clock::time_point now);
+  void rearmLocked();
 };
 
 namespace {
@@ -270,7 +290,79 @@ int onProgress(void* user, curl_off_t, curl_off_t downloaded, curl_off_t, curl_o
   return 0;
 }
 
+// libcurl tells which sockets to watch; `registered` (libcurl's per-socket
+// pointer) is non-null once the socket is in the epoll set.
+int onSocket(CURL*, curl_socket_t socket, int what, void* user, void* registered) {
+  auto& core = *static_cast<URLSessionCore*>(user);
+  if (what == CURL_POLL_REMOVE) {
+    if (registered) {
+      ::epoll_ctl(core.epollFd, EPOLL_CTL_DEL, socket, nullptr);
+      curl_multi_assign(core.multi, socket, nullptr);
+    }
+    return 0;
+  }
+  epoll_event event{};
+  event.events = ((what & CURL_POLL_IN) ? EPOLLIN : 0u) | ((what & CURL_POLL_OUT) ? EPOLLOUT : 0u);
+  event.data.fd = socket;
+  if (registered) {
+    ::epoll_ctl(core.epollFd, EPOLL_CTL_MOD, socket, &event);
+  } else {
+    // A number reused after a close that epoll has not seen yet is there already.
+    if (::epoll_ctl(core.epollFd, EPOLL_CTL_ADD, socket, &event) != 0 && errno == EEXIST) {
+      ::epoll_ctl(core.epollFd, EPOLL_CTL_MOD, socket, &event);
+    }
+    curl_multi_assign(core.multi, socket, &core);
+  }
+  return 0;
+}
+
+int onTimer(CURLM*, long milliseconds, void* user) {
+  auto& core = *static_cast<URLSessionCore*>(user);
+  core.timeoutNow = milliseconds == 0;
+  core.curlDeadline = milliseconds < 0 ? Clock::time_point::max()
+                                       : Clock::now() + std::chrono::milliseconds(milliseconds);
+  return 0;
+}
+
+int curlEvents(std::uint32_t events) {
+  int flags = 0;
+  if (events & (EPOLLIN | EPOLLHUP | EPOLLRDHUP)) flags |= CURL_CSELECT_IN;
+  if (events & EPOLLOUT) flags |= CURL_CSELECT_OUT;
+  if (events & EPOLLERR) flags |= CURL_CSELECT_ERR;
+  return flags;
+}
+
 }  // namespace
+
+URLSessionCore::URLSessionCore(URLSessionConfiguration configuration,
+                               std::shared_ptr<OperationQueue> queue)
+    : configuration(std::move(configuration)), delegateQueue(std::move(queue)) {
+  initializeCurlOnce();
+  epollFd = ::epoll_create1(EPOLL_CLOEXEC);
+  timerFd = ::timerfd_create(CLOCK_MONOTONIC, TFD_NONBLOCK | TFD_CLOEXEC);
+  wakeFd = ::eventfd(0, EFD_NONBLOCK | EFD_CLOEXEC);
+  for (int fd : {timerFd, wakeFd}) {
+    epoll_event event{};
+    event.events = EPOLLIN;
+    event.data.fd = fd;
+    ::epoll_ctl(epollFd, EPOLL_CTL_ADD, fd, &event);
+  }
+  multi = curl_multi_init();
+  curl_multi_setopt(multi, CURLMOPT_PIPELINING, CURLPIPE_MULTIPLEX);
+  curl_multi_setopt(multi, CURLMOPT_MAX_HOST_CONNECTIONS,
+                    static_cast<long>(std::max<std::int64_t>(
+                        0, this->configuration.HTTPMaximumConnectionsPerHost)));
+  curl_multi_setopt(multi, CURLMOPT_SOCKETFUNCTION, onSocket);
+  curl_multi_setopt(multi, CURLMOPT_SOCKETDATA, this);
+  curl_multi_setopt(multi, CURLMOPT_TIMERFUNCTION, onTimer);
+  curl_multi_setopt(multi, CURLMOPT_TIMERDATA, this);
+}
+
+URLSessionCore::~URLSessionCore() {
+  // Transfers hold the core through their task, so none is left by now.
+  curl_multi_cleanup(multi);  // closes the cached connections
+  for (int fd : {epollFd, timerFd, wakeFd}) ::close(fd);
+}
 
 bool URLSessionCore::configure(Transfer& t) {
   const URLRequest& request = t.request;
@@ -344,47 +436,131 @@ bool URLSessionCore::configure(Transfer& t) {
   return true;
 }
 
-void URLSessionCore::submit(std::unique_ptr<Transfer> transfer) {
-  bool startThread = false;
+template <class Work>
+void URLSessionCore::withLock(Work&& work) {
+  std::vector<Ended> done;
   {
     std::lock_guard lock(mutex);
-    if (!invalidated) {
-      incoming.push_back(std::move(transfer));
-      if (!threadRunning) threadRunning = startThread = true;
+    work();
+    // Taking a transfer out may let a queued one start.
+    if (timeoutNow) driveLocked(CURL_SOCKET_TIMEOUT, 0);
+    rearmLocked();
+    done.swap(ended);
+    if (invalidated && active.empty() && threadRunning) {
+      const std::uint64_t one = 1;
+      (void)!::write(wakeFd, &one, sizeof one);
     }
   }
-  if (transfer) {  // the session was invalidated
+  for (Ended& e : done) finish(std::move(e));
+}
+
+void URLSessionCore::driveLocked(curl_socket_t socket, int events) {
+  int running = 0;
+  // libcurl's timer is one-shot: running the time-outs consumes it, and
+  // libcurl announces the next one, if any, through onTimer().
+  auto runTimeouts = [&] {
+    timeoutNow = false;
+    curlDeadline = Clock::time_point::max();
+    curl_multi_socket_action(multi, CURL_SOCKET_TIMEOUT, 0, &running);
+  };
+  if (socket == CURL_SOCKET_TIMEOUT) {
+    runTimeouts();
+  } else {
+    curl_multi_socket_action(multi, socket, events, &running);
+  }
+  // A zero time-out asks for another call straight away; should libcurl keep
+  // asking, rearmLocked() leaves it to the network thread.
+  for (int round = 0; timeoutNow && round < 4; ++round) runTimeouts();
+  int queued = 0;
+  while (CURLMsg* message = curl_multi_info_read(multi, &queued)) {
+    if (message->msg != CURLMSG_DONE) continue;
+    Transfer* transfer = nullptr;
+    curl_easy_getinfo(message->easy_handle, CURLINFO_PRIVATE, &transfer);
+    const CURLcode result = message->data.result;  // the message goes with the handle
+    endLocked(transfer->task->taskIdentifier(), result, 0);
+  }
+}
+
+void URLSessionCore::endLocked(std::uint64_t taskIdentifier, CURLcode result, std::int64_t code) {
+  const auto it = active.find(taskIdentifier);
+  if (it == active.end()) return;
+  std::unique_ptr<Transfer> transfer = std::move(it->second);
+  active.erase(it);
+  curl_multi_remove_handle(multi, transfer->easy);
+  ended.push_back({std::move(transfer), result, code});
+}
+
+void URLSessionCore::expireIdleLocked(Clock::time_point now) {
+  idleCheck = Clock::time_point::max();
+  std::vector<std::uint64_t> idle;
+  for (const auto& [identifier, transfer] : active) {
+    const auto due = transfer->lastActivity + transfer->idleTimeout;
+    if (due <= now) {
+      idle.push_back(identifier);
+    } else {
+      idleCheck = std::min(idleCheck, due);
+    }
+  }
+  for (std::uint64_t identifier : idle) endLocked(identifier, CURLE_OK, URLErrorTimedOut);
+}
+
+// The timer may fire early (a deadline moved out); it never fires late.
+void URLSessionCore::rearmLocked() {
+  if (timeoutNow) curlDeadline = Clock::now();
+  const Clock::time_point due = std::min(curlDeadline, idleCheck);
+  if (due >= armed) return;
+  armed = due;
+  const auto since = std::chrono::duration_cast<std::chrono::nanoseconds>(due.time_since_epoch());
+  itimerspec spec{};
+  spec.it_value.tv_sec = static_cast<time_t>(since.count() / 1'000'000'000);
+  spec.it_value.tv_nsec = static_cast<long>(since.count() % 1'000'000'000);
+  if (spec.it_value.tv_sec == 0 && spec.it_value.tv_nsec == 0) spec.it_value.tv_nsec = 1;
+  ::timerfd_settime(timerFd, TFD_TIMER_ABSTIME, &spec, nullptr);
+}
+
+void URLSessionCore::submit(std::unique_ptr<Transfer> transfer) {
+  const bool usable = multi && epollFd >= 0 && timerFd >= 0 && wakeFd >= 0;
+  if (!usable || !configure(*transfer)) {
+    const URLPtr url = transfer->request.URL();
+    complete(std::move(transfer), std::nullopt, nullptr,
+             makeURLError(URLErrorUnknown, "The request could not be prepared.", url));
+    return;
+  }
+  bool startThread = false;
+  withLock([&] {
+    // A cancel() that came first has found nothing to take out.
+    if (invalidated || transfer->task->state() == URLSessionTask::State::canceling) return;
+    Transfer& t = *transfer;
+    t.lastActivity = Clock::now();
+    idleCheck = std::min(idleCheck, t.lastActivity + t.idleTimeout);
+    curl_multi_add_handle(multi, t.easy);
+    active.emplace(t.task->taskIdentifier(), std::move(transfer));
+    if (!threadRunning) threadRunning = startThread = true;
+    driveLocked(CURL_SOCKET_TIMEOUT, 0);  // sends the request if it can
+  });
+  if (startThread) std::thread([core = shared_from_this()] { core->run(); }).detach();
+  if (transfer) {
     const URLPtr url = transfer->request.URL();
     complete(std::move(transfer), std::nullopt, nullptr, cancelledError(url));
-  } else if (startThread) {
-    std::thread([core = shared_from_this()] { core->run(); }).detach();
-  } else {
-    curl_multi_wakeup(multi);
   }
 }
 
 void URLSessionCore::requestCancel(std::uint64_t taskIdentifier) {
-  {
-    std::lock_guard lock(mutex);
-    cancelRequests.push_back(taskIdentifier);
-  }
-  curl_multi_wakeup(multi);
+  withLock([&] { endLocked(taskIdentifier, CURLE_OK, URLErrorCancelled); });
 }
 
 void URLSessionCore::invalidate(bool cancelRunning) {
-  {
-    std::lock_guard lock(mutex);
+  withLock([&] {
     invalidated = true;
-    if (cancelRunning) cancelEverything = true;
-  }
-  curl_multi_wakeup(multi);
+    if (!cancelRunning) return;
+    std::vector<std::uint64_t> running;
+    for (const auto& entry : active) running.push_back(entry.first);
+    for (std::uint64_t identifier : running) endLocked(identifier, CURLE_OK, URLErrorCancelled);
+  });
 }
 
 void URLSessionCore::complete(std::unique_ptr<Transfer> transfer, std::optional<Data> data,
                               HTTPURLResponsePtr response, ErrorPtr error) {
-  if (transfer->easy) {
-    curl_multi_remove_handle(multi, transfer->easy);
-  }
   URLSessionTaskPtr task = std::move(transfer->task);
   auto completion = std::move(transfer->completion);
   transfer.reset();  // frees the easy handle on this thread
@@ -403,8 +579,20 @@ void URLSessionCore::complete(std::unique_ptr<Transfer> transfer, std::optional<
   });
 }
 
-void URLSessionCore::finish(std::unique_ptr<Transfer> t, CURLcode result) {
-  const URLPtr& url = t->request.URL();
+void URLSessionCore::finish(Ended e) {
+  std::unique_ptr<Transfer>& t = e.transfer;
+  const URLPtr url = t->request.URL();
+  if (e.code == URLErrorCancelled) {
+    complete(std::move(t), std::nullopt, nullptr, cancelledError(url));
+    return;
+  }
+  if (e.code == URLErrorTimedOut) {
+    complete(std::move(t), std::nullopt, nullptr,
+             makeURLError(URLErrorTimedOut, "The request timed out.", url,
+                          "No data moved for the request's time-out."));
+    return;
+  }
+  const CURLcode result = e.result;
   if (result != CURLE_OK) {
     if (t->headersTooLarge) {
       auto error = makeURLError(
@@ -420,13 +608,15 @@ void URLSessionCore::finish(std::unique_ptr<Transfer> t, CURLcode result) {
     // memory, and an answer without a status line as an unsupported protocol.
     // (A header line over libcurl's limit leaves no text in the error
     // buffer: running out of memory once the answer has begun is taken as
-    // that.)
+    // that.) A body whose chunked encoding is broken comes as a receive error.
     const bool answerBegun = t->headerBytes > 0;
     const bool httpZeroNine = detail.find("HTTP/0.9") != std::string::npos;
     if ((result == CURLE_OUT_OF_MEMORY && answerBegun) ||
         (result == CURLE_UNSUPPORTED_PROTOCOL && httpZeroNine)) {
       mapped = {URLErrorBadServerResponse,
                 "The server returned a response that could not be read."};
+    } else if (result == CURLE_RECV_ERROR && detail.find("chunked-encoding") != std::string::npos) {
+      mapped = {URLErrorCannotParseResponse, "The server's response could not be parsed."};
     }
     complete(std::move(t), std::nullopt, nullptr,
              makeURLError(mapped.code, mapped.description, url, headerText(detail)));
@@ -455,84 +645,38 @@ void URLSessionCore::finish(std::unique_ptr<Transfer> t, CURLcode result) {
 }
 
 void URLSessionCore::run() {
+  epoll_event events[32];
   for (;;) {
-    std::deque<std::unique_ptr<Transfer>> arrived;
-    std::vector<std::uint64_t> cancels;
-    bool cancelAll = false;
+    const int count = ::epoll_wait(epollFd, events, 32, -1);
+    bool stop = false;
+    std::vector<Ended> done;
     {
       std::lock_guard lock(mutex);
-      arrived.swap(incoming);
-      cancels.swap(cancelRequests);
-      cancelAll = cancelEverything;
-      if (invalidated && active.empty() && arrived.empty()) {
-        threadRunning = false;
-        break;
+      bool timerFired = false;
+      for (int i = 0; i < count; ++i) {
+        const int fd = events[i].data.fd;
+        if (fd == timerFd || fd == wakeFd) {
+          std::uint64_t ticks = 0;
+          (void)!::read(fd, &ticks, sizeof ticks);
+          if (fd == timerFd) {
+            timerFired = true;
+            armed = Clock::time_point::max();
+          }
+        } else {
+          driveLocked(fd, curlEvents(events[i].events));
+        }
       }
-    }
-    for (auto& transfer : arrived) {
-      Transfer& t = *transfer;
-      if (cancelAll || t.task->state() == URLSessionTask::State::canceling) {
-        complete(std::move(transfer), std::nullopt, nullptr, cancelledError(t.request.URL()));
-        continue;
+      if (timerFired) {
+        const auto now = Clock::now();
+        if (now >= curlDeadline) driveLocked(CURL_SOCKET_TIMEOUT, 0);
+        if (now >= idleCheck) expireIdleLocked(now);
       }
-      if (!configure(t)) {
-        complete(
-            std::move(transfer), std::nullopt, nullptr,
-            makeURLError(URLErrorUnknown, "The request could not be prepared.", t.request.URL()));
-        continue;
-      }
-      t.lastActivity = Clock::now();
-      curl_multi_add_handle(multi, t.easy);
-      active.emplace(t.easy, std::move(transfer));
+      rearmLocked();
+      done.swap(ended);
+      if (invalidated && active.empty()) threadRunning = false, stop = true;
     }
-    // Cancellations.
-    for (auto it = active.begin(); it != active.end();) {
-      const bool cancel =
-          cancelAll || std::find(cancels.begin(), cancels.end(),
-                                 it->second->task->taskIdentifier()) != cancels.end();
-      if (!cancel) {
-        ++it;
-        continue;
-      }
-      auto transfer = std::move(it->second);
-      it = active.erase(it);
-      const URLPtr url = transfer->request.URL();
-      complete(std::move(transfer), std::nullopt, nullptr, cancelledError(url));
-    }
-
-    int running = 0;
-    curl_multi_perform(multi, &running);
-    while (CURLMsg* message = curl_multi_info_read(multi, &running)) {
-      if (message->msg != CURLMSG_DONE) continue;
-      auto it = active.find(message->easy_handle);
-      if (it == active.end()) continue;
-      const CURLcode result = message->data.result;
-      auto transfer = std::move(it->second);
-      active.erase(it);
-      finish(std::move(transfer), result);
-    }
-
-    // Idle time-outs, and how long to wait for the next event.
-    const auto now = Clock::now();
-    auto wait = std::chrono::milliseconds(1000);
-    for (auto it = active.begin(); it != active.end();) {
-      Transfer& t = *it->second;
-      const auto idleFor = now - t.lastActivity;
-      if (idleFor >= t.idleTimeout) {
-        auto transfer = std::move(it->second);
-        it = active.erase(it);
-        const URLPtr url = transfer->request.URL();
-        complete(std::move(transfer), std::nullopt, nullptr,
-                 makeURLError(URLErrorTimedOut, "The request timed out.", url,
-                              "No data moved for the request's time-out."));
-        continue;
-      }
-      wait = std::min(
-          wait, std::chrono::duration_cast<std::chrono::milliseconds>(t.idleTimeout - idleFor) +
-                    std::chrono::milliseconds(1));
-      ++it;
-    }
-    curl_multi_poll(multi, nullptr, 0, static_cast<int>(wait.count()), nullptr);
+    for (Ended& e : done) finish(std::move(e));
+    if (stop) return;
   }
 }
 

@@ -1,10 +1,12 @@
 // URLSession: HTTP and HTTPS transfers on libcurl.
 //
-// A session owns one libcurl multi handle, driven by a network thread of its
-// own: connections are reused between tasks, HTTP/2 is used over TLS where
-// the server offers it, certificates are checked against the system's store,
-// redirects are followed (at most 16), and gzip, deflate and brotli answers
-// are decoded. Each task's completion handler runs on the session's delegate
+// A session owns one libcurl multi handle: connections are reused between
+// tasks, HTTP/2 is used over TLS where the server offers it, certificates are
+// checked against the system's store, redirects are followed (at most 16), and
+// gzip, deflate and brotli answers are decoded. resume() sends the request on
+// the calling thread as far as the socket takes it; a network thread of the
+// session's own, started with its first task, waits for answers and
+// deadlines. Each task's completion handler runs on the session's delegate
 // queue (a serial OperationQueue unless one is given), never inline on the
 // thread that resumed or cancelled the task.
 //
