@@ -1,5 +1,7 @@
 #include "kivi/foundation/url.h"
 
+#include <utility>
+
 #include "kivi/foundation/url_components.h"
 
 namespace kivi {
@@ -30,16 +32,19 @@ bool neverAllowed(unsigned char c) noexcept {
 }
 
 // Percent-encodes the bytes of `text` that could never be valid in a URL,
-// leaving its structure ("/", "?", "#", ...) alone.
+// leaving its structure ("/", "?", the first "#", ...) alone. A "#" after the
+// first belongs to the fragment's text, so it is encoded too.
 std::string encodeInvalidCharacters(std::string_view text) {
   static constexpr char kHex[] = "0123456789ABCDEF";
   std::string out;
   out.reserve(text.size());
+  bool inFragment = false;
   for (std::size_t i = 0; i < text.size(); ++i) {
     const auto c = static_cast<unsigned char>(text[i]);
     const bool strayPercent =
         c == '%' && !(i + 2 < text.size() && isHexDigit(text[i + 1]) && isHexDigit(text[i + 2]));
-    if (strayPercent || neverAllowed(c)) {
+    const bool secondHash = c == '#' && std::exchange(inFragment, true);
+    if (strayPercent || secondHash || neverAllowed(c)) {
       out += '%';
       out += kHex[c >> 4];
       out += kHex[c & 15];

@@ -73,8 +73,8 @@ inline HeaderDictionaryPtr KivSdkResponseHeadersForLogging(std::nullptr_t, const
 // A new answer with the URL of KivSdkURLForLogging, the headers of
 // KivSdkResponseHeadersForLogging, the same status code and the HTTP
 // version "1.0". Null for null. When the redacted URL cannot be made (see
-// KivSdkURLForLogging) or does not parse again (a decoded "%23" that puts a
-// second "#" into it, say), `response` itself is returned, unredacted.
+// KivSdkURLForLogging) or does not parse again (a user name holding a
+// decoded "@", say), `response` itself is returned, unredacted.
 HTTPURLResponsePtr KivSdkResponseForLogging(const HTTPURLResponsePtr& response);
 
 // An allow-list: every entry of `headers` with its value when its name is
