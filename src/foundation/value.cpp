@@ -1,5 +1,6 @@
 #include "kivi/foundation/value.h"
 
+#include <charconv>
 #include <cmath>
 #include <cstdio>
 #include <cstdlib>
@@ -67,15 +68,10 @@ std::string Number::stringValue() const {
     case Type::UInt:
       return std::to_string(u_);
     case Type::Double: {
+      // The shortest text that reads back the same ("100", "0.1", "1e+20");
+      // std::to_chars never looks at the locale's decimal point.
       char buf[32];
-      std::snprintf(buf, sizeof buf, "%.17g", d_);
-      // Prefer the shortest text that reads back the same.
-      for (int precision = 1; precision < 17; ++precision) {
-        char shorter[32];
-        std::snprintf(shorter, sizeof shorter, "%.*g", precision, d_);
-        if (std::strtod(shorter, nullptr) == d_) return shorter;
-      }
-      return buf;
+      return std::string(buf, std::to_chars(buf, buf + sizeof buf, d_).ptr);
     }
     default:
       return std::to_string(i_);
@@ -251,9 +247,13 @@ void describeScalar(const Value& v, std::string& out) {
       return;
     }
     case Value::Kind::Date: {
-      char buf[48];
-      std::snprintf(buf, sizeof buf, "<date %.3f>", v.asDate()->timeIntervalSince1970);
-      out += buf;
+      char buf[400];  // the largest double written in full fits
+      char* end = std::to_chars(buf, buf + sizeof buf, v.asDate()->timeIntervalSince1970,
+                                std::chars_format::fixed, 3)
+                      .ptr;
+      out += "<date ";
+      out.append(buf, end);
+      out += '>';
       return;
     }
     case Value::Kind::URL:

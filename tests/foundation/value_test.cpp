@@ -67,6 +67,10 @@ TEST(Value, NumbersKeepTheirFlavourButCompareByValue) {
                                                     {Number(kI64Min), "-9223372036854775808"},
                                                     {Number(2.5), "2.5"},
                                                     {Number(0.1), "0.1"},
+                                                    {Number(1.0 / 3), "0.3333333333333333"},
+                                                    {Number(1e20), "1e+20"},
+                                                    {Number(-1e-7), "-1e-07"},
+                                                    {Number(100.0), "100"},
                                                     {Number(true), "1"}};
   for (const auto& [number, text] : strings) EXPECT_EQ(number.stringValue(), text);
   EXPECT_EQ(Number(kU64Max).longLongValue(), kI64Max);  // saturates
