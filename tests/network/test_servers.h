@@ -45,7 +45,8 @@ inline std::string refusedURL() {
 // Every answer carries "x-thing: yes". GET /status/<n>?type=<t>: status n,
 // {"status":n} as t (JSON by default). /redirect: 302 to /status/200; /loop:
 // 302 to itself. /gate: {"ok":true} once release() is called. Anything else
-// (any method): {"ok":true}.
+// (any method): {"ok":true}. A "set-cookie" query parameter comes back as
+// the answer's Set-Cookie field.
 class HttpServer {
  public:
   struct Received {
@@ -62,6 +63,8 @@ class HttpServer {
       }
       arrived.notify();
       res.set_header("x-thing", "yes");
+      if (req.has_param("set-cookie"))
+        res.set_header("Set-Cookie", req.get_param_value("set-cookie"));
       if (req.path == "/redirect" || req.path == "/loop")
         return res.set_redirect(req.path == "/loop" ? "/loop" : "/status/200");
       if (req.path == "/gate") gate_.wait(1, kServerWait);

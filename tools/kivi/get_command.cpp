@@ -5,8 +5,10 @@
 
 #include "command.h"
 #include "kivi/foundation/json_serialization.h"
+#include "kivi/logging/log_redaction.h"
 #include "kivi/operations/kiv_async_service.h"
 #include "kivi/operations/kiv_json_api_operation.h"
+#include "verbose.h"
 
 namespace kivi::tool {
 
@@ -27,6 +29,11 @@ struct GetOptions {
 URLPtr parseURL(const std::string& text) {
   URLPtr url = URL::URLWithString(text, /*encodingInvalidCharacters=*/false);
   return url && url->scheme() ? url : nullptr;
+}
+
+// URLs reach the log with their query values masked.
+std::string loggable(const URLPtr& url) {
+  return KivSdkURLForLogging(url).value_or("(a URL that cannot be logged)");
 }
 
 // Accepts a 2xx answer whose body is empty or valid JSON.
@@ -52,15 +59,29 @@ class GetOperation : public KivJSONAPIOperation {
 
   std::optional<URLRequest> createURLRequestWithError(ErrorPtr* error) override {
     auto request = KivJSONAPIOperation::createURLRequestWithError(error);
-    if (!request || !options_.timeout) return request;
-    MutableURLRequest changed(*request);
-    changed.setTimeoutInterval(*options_.timeout);
-    return URLRequest(changed);
+    if (request && options_.timeout) {
+      MutableURLRequest changed(*request);
+      changed.setTimeoutInterval(*options_.timeout);
+      request = URLRequest(changed);
+    }
+    if (request) {
+      logger().logInfo(nullptr, __FILE__, __func__, __LINE__,
+                       "sending " + request->HTTPMethod() + " " + loggable(request->URL()));
+    }
+    return request;
   }
 
   // Keeps the body for printing, whatever the operation decides.
   void didCompleteUrlRequest(const URLRequest& request, const std::optional<Data>& data,
                              HTTPURLResponsePtr response, ErrorPtr error) override {
+    if (response) {
+      logger().logInfo(nullptr, __FILE__, __func__, __LINE__,
+                       "answer: " + KivSdkResponseForLogging(response)->description());
+    } else if (error) {
+      logger().logInfo(nullptr, __FILE__, __func__, __LINE__,
+                       "no answer from " + loggable(request.URL()) + ": " + error->domain() + " " +
+                           std::to_string(error->code()));
+    }
     body = data.value_or(Data{});
     KivJSONAPIOperation::didCompleteUrlRequest(request, data, std::move(response),
                                                std::move(error));
@@ -207,7 +228,10 @@ Command getCommand() {
           "Prints 'status: <name>', then 'http: <code>', the response headers, a blank\n"
           "line and the body when there was an answer, and 'error: <domain> <code>:\n"
           "<description>' when there is an error. The exit code is the status value\n"
-          "(0 Success ... 8 InvalidServerResponse); 2 also for bad arguments.\n",
+          "(0 Success ... 8 InvalidServerResponse); 2 also for bad arguments.\n\n"
+          "With 'kivi --verbose get', the request and the answer are also logged to\n"
+          "standard error, redacted: query values, the Authorization header and\n"
+          "cookie values appear as ***.\n",
           runGet};
 }
 

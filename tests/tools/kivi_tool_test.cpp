@@ -1,0 +1,153 @@
+// The kivi binary run as a user runs it: arguments, standard input, exit
+// code, and what lands on standard output and standard error.
+#include <sys/wait.h>
+
+#include <cstdlib>
+#include <fstream>
+#include <sstream>
+
+#include "network/test_servers.h"
+
+namespace kivi {
+namespace {
+
+using testing::HttpServer;
+
+struct ToolRun {
+  int exit = -1;
+  std::string out, err;
+};
+
+std::string quoted(const std::string& arg) {
+  std::string q = "'";
+  for (char c : arg) q += c == '\'' ? std::string("'\\''") : std::string(1, c);
+  return q + "'";
+}
+
+std::string slurp(const std::string& path) {
+  std::ostringstream text;
+  text << std::ifstream(path).rdbuf();
+  return text.str();
+}
+
+ToolRun kivi(const std::vector<std::string>& args, const std::string& input = "") {
+  const std::string dir = ::testing::TempDir();
+  std::ofstream(dir + "kivi_in") << input;
+  std::string command = quoted(KIVI_TOOL_PATH);
+  for (const auto& arg : args) command += " " + quoted(arg);
+  command += " <" + dir + "kivi_in >" + dir + "kivi_out 2>" + dir + "kivi_err";
+  const int status = std::system(command.c_str());
+  return {WIFEXITED(status) ? WEXITSTATUS(status) : -1, slurp(dir + "kivi_out"),
+          slurp(dir + "kivi_err")};
+}
+
+TEST(KiviToolTest, GetClassifiesEachAnswerAndExitsWithItsStatus) {
+  HttpServer server;
+  const struct {
+    std::vector<std::string> args;
+    int exit;
+    std::string out, err;
+  } rows[] = {
+      {{"get", server.url("/")},
+       0,
+       "status: KivJSONAPIOperationCompletionStatusSuccess\nhttp: 200\n",
+       ""},
+      {{"get", server.url("/status/401")},
+       7,
+       "status: KivJSONAPIOperationCompletionStatusUnauthorized\nhttp: 401\n",
+       ""},
+      {{"get", server.url("/status/403")},
+       6,
+       "status: KivJSONAPIOperationCompletionStatusAccessDenied\n",
+       ""},
+      {{"get", server.url("/status/500")},
+       8,
+       "status: KivJSONAPIOperationCompletionStatusInvalidServerResponse\n",
+       ""},
+      {{"get", server.url("/?type=text/plain")},
+       5,
+       "status: KivJSONAPIOperationCompletionStatusInvalidContentType\n",
+       ""},
+      {{"get", server.url("/?type=text/plain"), "--allow-non-json"}, 0, "http: 200", ""},
+      {{"get", server.url("/"), "--method", "POST", "--json", "{\"a\":[1]}"}, 0, "Success", ""},
+      {{"get", server.url("/"), "--json", "{not json"}, 3, "FailedToBuildRequest", ""},
+      {{"get", testing::refusedURL()}, 4, "error: NSURLErrorDomain -1004: ", ""},
+      {{"get", "not a url"},
+       2,
+       "status: KivJSONAPIOperationCompletionStatusInvalidInput",
+       "is not a valid absolute URL"},
+      {{"get", server.url("/"), "--timeout", "0"}, 2, "", "positive number of seconds"},
+      {{"get", server.url("/"), "--header", "NoColon"}, 2, "", "'Name: value'"},
+      {{"get"}, 2, "", "no URL given"},
+  };
+  for (const auto& row : rows) {
+    const ToolRun run = kivi(row.args);
+    EXPECT_EQ(run.exit, row.exit) << row.args.back() << "\n" << run.out << run.err;
+    EXPECT_NE(run.out.find(row.out), std::string::npos) << run.out;
+    EXPECT_NE(run.err.find(row.err), std::string::npos) << run.err;
+  }
+  const auto requests = server.requests();
+  ASSERT_FALSE(requests.empty());
+  EXPECT_EQ(requests.back().method, "POST");
+  std::string body = requests.back().body;
+  std::erase_if(body, [](char c) { return c == ' ' || c == '\n'; });
+  EXPECT_EQ(body, "{\"a\":[1]}");
+}
+
+// Secrets go to the server and to standard output, which belong to the user,
+// but never into the log on standard error.
+TEST(KiviToolTest, VerboseGetLogsRequestAndAnswerRedacted) {
+  HttpServer server;
+  const ToolRun run =
+      kivi({"--verbose", "get",
+            server.url("/p?key=SecretKey1&set-cookie=sid%3DSecretCookie2%3B%20Path%3D/"),
+            "--header", "Authorization: Bearer SecretToken3"});
+  ASSERT_EQ(run.exit, 0) << run.out << run.err;
+  EXPECT_NE(run.out.find("Set-Cookie: sid=SecretCookie2; Path=/"), std::string::npos) << run.out;
+  ASSERT_EQ(server.requests().size(), 1u);
+  EXPECT_EQ(server.requests()[0].headers.find("Authorization")->second, "Bearer SecretToken3");
+
+  for (const std::string& expected : std::vector<std::string>{
+           "[info] kivi main.cpp:", "running command get",
+           "sending GET " + server.url("/p?key=***&set-cookie=***"), "answer: ", "Status Code: 200",
+           "Set-Cookie: sid=***, path=/, domain=127.0.0.1;"}) {
+    EXPECT_NE(run.err.find(expected), std::string::npos) << expected << " not in\n" << run.err;
+  }
+  for (const char* secret : {"SecretKey1", "SecretCookie2", "SecretToken3"})
+    EXPECT_EQ(run.err.find(secret), std::string::npos) << secret << " in\n" << run.err;
+
+  const ToolRun quiet = kivi({"get", server.url("/")});
+  EXPECT_EQ(quiet.err, "");
+}
+
+TEST(KiviToolTest, TextCommands) {
+  const struct {
+    std::vector<std::string> args;
+    std::string input;
+    int exit;
+    std::string out;
+  } rows[] = {
+      {{"sha256", "abc"},
+       "",
+       0,
+       "ba7816bf8f01cfea414140de5dae2223b00361a396177a9cb410ff61f20015ad\n"},
+      {{"base64", "encode", "foobar"}, "", 0, "Zm9vYmFy\n"},
+      {{"redact", "url", "https://h/a?k=v&e="}, "", 0, "https://h/a?k=***&e=\n"},
+      {{"redact", "token"}, "", 0, "nil\n"},
+      {{"redact", "headers"}, "X-B: 2\nAuthorization: t\n", 0, "Authorization: ***\nX-B: 2\n"},
+      {{"redact", "keep", "X-B"}, "X-B: 2\nX-A: 1\n", 0, "X-A: ***\nX-B: 2\n"},
+      {{"redact", "headers"}, "no colon\n", 2, ""},
+      {{"obfuscate", "Hello"}, "", 0, "BZ\\WU\n"},
+      {{"unobfuscate", "BZ\\WU"}, "", 0, "Hello\n"},
+      {{"nosuchcommand"}, "", 2, ""},
+      {{}, "", 2, ""},
+  };
+  for (const auto& row : rows) {
+    const ToolRun run = kivi(row.args, row.input);
+    EXPECT_EQ(run.exit, row.exit) << (row.args.empty() ? "" : row.args[0]) << "\n" << run.err;
+    EXPECT_EQ(run.out, row.out) << run.err;
+  }
+}
+
+}  // namespace
+}  // namespace kivi
