@@ -63,7 +63,8 @@ std::optional<std::string> decoded(const std::optional<std::string>& text) {
 // The components of a URL's text, which always parses: the constructor is
 // only given text that did.
 URLComponents parts(const std::string& text) {
-  return URLComponents::fromString(text).value_or(URLComponents());
+  if (auto components = URLComponents::fromString(text)) return std::move(*components);
+  return URLComponents();
 }
 
 }  // namespace

@@ -103,6 +103,22 @@ class SpinGuard {
   std::atomic<bool>& flag_;
 };
 
+// Every delegate assignment of every logger gets a number never used before.
+std::atomic<std::uint64_t> gNextGeneration{1};
+
+// The weak reference this thread last read from a logger, with the number of
+// the assignment it came from. While the logger's number is unchanged, a log
+// call upgrades this copy and never touches the logger's lock: one atomic
+// read-modify-write on the way in and one on the way out, instead of three.
+struct DelegateCache {
+  ~DelegateCache();
+  std::uint64_t generation = 0;
+  std::weak_ptr<KivSdkLoggerDelegate> delegate;
+};
+thread_local DelegateCache tDelegateCache;
+thread_local bool tDelegateCacheGone = false;  // trivially destructible
+DelegateCache::~DelegateCache() { tDelegateCacheGone = true; }
+
 }  // namespace
 
 std::shared_ptr<KivSdkLogger> KivSdkLogger::create(
@@ -116,8 +132,24 @@ KivSdkLogger::~KivSdkLogger() = default;
 
 std::shared_ptr<KivSdkLoggerDelegate> KivSdkLogger::delegate() const {
   if (!hasDelegate_.load(std::memory_order_acquire)) return nullptr;
-  SpinGuard guard(locked_);
-  return delegate_.lock();
+  const std::uint64_t generation = generation_.load(std::memory_order_acquire);
+  if (tDelegateCacheGone) {  // this thread is being torn down
+    SpinGuard guard(locked_);
+    return delegate_.lock();
+  }
+  DelegateCache& cache = tDelegateCache;
+  if (cache.generation != generation) {
+    std::weak_ptr<KivSdkLoggerDelegate> current;
+    std::uint64_t currentGeneration;
+    {
+      SpinGuard guard(locked_);
+      current = delegate_;
+      currentGeneration = generation_.load(std::memory_order_relaxed);
+    }
+    cache.delegate.swap(current);  // the old copy is released outside the lock
+    cache.generation = currentGeneration;
+  }
+  return cache.delegate.lock();
 }
 
 void KivSdkLogger::setDelegate(const std::shared_ptr<KivSdkLoggerDelegate>& delegate) {
@@ -125,6 +157,8 @@ void KivSdkLogger::setDelegate(const std::shared_ptr<KivSdkLoggerDelegate>& dele
   {
     SpinGuard guard(locked_);
     delegate_.swap(replacement);
+    generation_.store(gNextGeneration.fetch_add(1, std::memory_order_relaxed),
+                      std::memory_order_release);
     hasDelegate_.store(delegate != nullptr, std::memory_order_release);
   }
   // The old reference is released here, outside the lock.

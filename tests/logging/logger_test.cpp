@@ -171,6 +171,13 @@ TEST(KivSdkLogger, HoldsTheDelegateWeakly) {
   logger->logWithModule("m", 1, "f", "g", 1, "to the replacement");
   EXPECT_TRUE(recorder->take().empty());
   EXPECT_EQ(replacement->take().size(), 1u);
+  // Two loggers used in turn on one thread each reach their own delegate.
+  for (int i = 0; i < 3; ++i) {
+    logger->logWithModule("m", 1, "f", "g", 1, "a");
+    facade.logCritical("m", "f", "g", 1, "b");
+  }
+  EXPECT_EQ(replacement->take().size(), 3u);
+  EXPECT_EQ(recorder->take().size(), 3u);
 
   logger->setDelegate(nullptr);
   facade.setLoggerDelegate(nullptr);

@@ -25,7 +25,11 @@
 // another thread replaces the delegate. A log call reads the delegate once and
 // keeps it alive until the delegate method returns; the method runs on the
 // calling thread. There is no lock around the delegate call. The delegate is
-// held weakly: once its last owner releases it, every line is dropped.
+// held weakly: once its last owner releases it, every line is dropped. (Each
+// thread that logged keeps a weak reference to the delegate it last used, so
+// the memory of a delegate made by std::make_shared is returned when that
+// thread logs through another delegate or exits; its destructor runs on
+// time.)
 #pragma once
 
 #include <array>
@@ -115,13 +119,15 @@ class KivSdkLogger : public Object {
            const char* functionName, std::uint64_t lineNumber, KivSdkNullableString formatString,
            std::span<const FormatArg> args) const;
 
-  // delegate_ is guarded by a spin lock held only to upgrade or swap the weak
-  // reference: one atomic exchange per call, cheaper than a mutex or an
-  // atomic weak_ptr, and never held while user code runs. hasDelegate_ lets
-  // a logger that was never given a delegate (or was given null) skip the
-  // lock.
+  // delegate_ is guarded by a spin lock (locked_), held only to copy or swap
+  // the weak reference and never while user code runs. generation_ changes
+  // with every setDelegate (under the lock); each thread keeps a copy of the
+  // weak reference it last read with its generation, so a call takes the
+  // lock only after the delegate changed. hasDelegate_ lets a logger without
+  // a delegate skip all of it.
   mutable std::atomic<bool> locked_{false};
   std::atomic<bool> hasDelegate_{false};
+  std::atomic<std::uint64_t> generation_{0};
   std::weak_ptr<KivSdkLoggerDelegate> delegate_;
 };
 
