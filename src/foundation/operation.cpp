@@ -1,28 +1,11 @@
 #include "kivi/foundation/operation.h"
 
 #include <algorithm>
-#include <condition_variable>
 
 #include "kivi/foundation/worker_pool.h"
 #include "queue_core.h"
 
 namespace kivi {
-
-namespace {
-
-// Wakes waitUntilFinished() callers; shared by all operations.
-struct FinishMonitor {
-  std::mutex mutex;
-  std::condition_variable cv;
-  std::atomic<int> waiters{0};
-};
-
-FinishMonitor& finishMonitor() {
-  static FinishMonitor* monitor = new FinishMonitor;
-  return *monitor;
-}
-
-}  // namespace
 
 Operation::~Operation() = default;
 
@@ -150,11 +133,8 @@ void Operation::setName(std::string name) {
 }
 
 void Operation::waitUntilFinished() {
-  FinishMonitor& monitor = finishMonitor();
-  std::unique_lock lock(monitor.mutex);
-  ++monitor.waiters;
-  monitor.cv.wait(lock, [this] { return finishHandled_.load(); });
-  --monitor.waiters;
+  // A futex of this operation's own: finishing wakes only its waiters.
+  finishDelivered_.wait(false, std::memory_order_acquire);
 }
 
 Value Operation::valueForKey(std::string_view key) const {
@@ -207,11 +187,8 @@ void Operation::didFinish() {
   }
   if (completion) WorkerPool::shared().submit(std::move(completion));
   if (core) core->operationFinished(*this);
-  FinishMonitor& monitor = finishMonitor();
-  if (monitor.waiters.load() > 0) {
-    std::lock_guard lock(monitor.mutex);
-    monitor.cv.notify_all();
-  }
+  finishDelivered_.store(true, std::memory_order_release);
+  finishDelivered_.notify_all();
 }
 
 void BlockOperation::main() {

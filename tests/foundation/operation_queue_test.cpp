@@ -148,6 +148,13 @@ TEST(OperationQueue, BlockingWaitsReturnOnceTheWorkIsDone) {
   ASSERT_TRUE(returned->wait(2)) << "a wait did not return";
   for (const auto& op : ops) EXPECT_TRUE(op->isFinished());
   EXPECT_TRUE(testing::returnsWithin([op = ops[0]] { op->waitUntilFinished(); }));
+  // By the time a wait returns, the queue has let the operation go.
+  for (int i = 0; i < 200; ++i) {
+    auto single = blockOp([] {});
+    queue->addOperation(single);
+    single->waitUntilFinished();
+    ASSERT_EQ(queue->operationCount(), 0u) << "round " << i;
+  }
 }
 
 TEST(OperationQueue, CancelAllOperations) {

@@ -112,6 +112,8 @@ class Operation : public Object {
   std::atomic<bool> baseExecuting_{false};
   std::atomic<bool> baseFinished_{false};
   std::atomic<bool> finishHandled_{false};
+  // Set, and waiters woken, once everything finishing entails is done.
+  std::atomic<bool> finishDelivered_{false};
   std::atomic<bool> cancelAnnounced_{false};
   std::atomic<bool> queueStarted_{false};
   std::atomic<bool> enqueued_{false};
