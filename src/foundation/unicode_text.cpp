@@ -22,6 +22,10 @@ bool isAscii(std::string_view text) {
 char asciiLower(char c) { return c >= 'A' && c <= 'Z' ? static_cast<char>(c + 32) : c; }
 char asciiUpper(char c) { return c >= 'a' && c <= 'z' ? static_cast<char>(c - 32) : c; }
 
+// ICU measures texts in int32_t. Longer ones are handled in pieces (case
+// mapping) or byte for byte (comparison), never passed with a wrapped length.
+constexpr std::size_t kMaxICULength = INT32_MAX;
+
 icu::UnicodeString utf16(std::string_view text) {
   return icu::UnicodeString::fromUTF8(
       icu::StringPiece(text.data(), static_cast<int32_t>(text.size())));
@@ -30,6 +34,7 @@ icu::UnicodeString utf16(std::string_view text) {
 // Compares with unorm_compare, which normalises lazily (FCD) and folds case
 // on the fly when asked to.
 bool normalizedEquals(std::string_view a, std::string_view b, uint32_t options) {
+  if (a.size() > kMaxICULength || b.size() > kMaxICULength) return a == b;
   const icu::UnicodeString ua = utf16(a);
   const icu::UnicodeString ub = utf16(b);
   UErrorCode status = U_ZERO_ERROR;
@@ -43,10 +48,21 @@ std::string mapCase(std::string_view text, Mapper mapper) {
   std::string out;
   out.reserve(text.size());
   icu::StringByteSink<std::string> sink(&out);
-  UErrorCode status = U_ZERO_ERROR;
-  // "" is the root locale: no Turkish or Lithuanian special cases.
-  mapper("", 0, icu::StringPiece(text.data(), static_cast<int32_t>(text.size())), sink, nullptr,
-         status);
+  // Beyond ICU's reach, the text is mapped in pieces that end on a character
+  // boundary.
+  while (!text.empty()) {
+    std::size_t piece = text.size();
+    if (piece > kMaxICULength) {
+      piece = kMaxICULength;
+      while (piece > 0 && (static_cast<unsigned char>(text[piece]) & 0xC0) == 0x80) --piece;
+      if (piece == 0) piece = kMaxICULength;
+    }
+    UErrorCode status = U_ZERO_ERROR;
+    // "" is the root locale: no Turkish or Lithuanian special cases.
+    mapper("", 0, icu::StringPiece(text.data(), static_cast<int32_t>(piece)), sink, nullptr,
+           status);
+    text.remove_prefix(piece);
+  }
   return out;
 }
 
@@ -60,21 +76,25 @@ bool isWhitespaceOrNewline(char32_t c) {
 
 std::string_view trimView(std::string_view text) {
   const auto* s = reinterpret_cast<const uint8_t*>(text.data());
-  const auto length = static_cast<int32_t>(text.size());
-  int32_t begin = 0;
+  const auto length = static_cast<std::int64_t>(text.size());
+  std::int64_t begin = 0;
   while (begin < length) {
-    int32_t next = begin;
+    std::int64_t next = begin;
     UChar32 c;
     U8_NEXT(s, next, length, c);
     if (c < 0 || !isWhitespaceOrNewline(static_cast<char32_t>(c))) break;
     begin = next;
   }
-  int32_t end = length;
+  std::int64_t end = length;
   while (end > begin) {
-    int32_t previous = end;
+    // Back to the lead byte of the last character (at most three
+    // continuation bytes), then read it forward: it must end at `end`.
+    std::int64_t previous = end - 1;
+    while (previous > begin && end - previous < 4 && (s[previous] & 0xC0) == 0x80) --previous;
+    std::int64_t next = previous;
     UChar32 c;
-    U8_PREV(s, begin, previous, c);
-    if (c < 0 || !isWhitespaceOrNewline(static_cast<char32_t>(c))) break;
+    U8_NEXT(s, next, end, c);
+    if (next != end || c < 0 || !isWhitespaceOrNewline(static_cast<char32_t>(c))) break;
     end = previous;
   }
   return text.substr(static_cast<size_t>(begin), static_cast<size_t>(end - begin));
@@ -127,9 +147,9 @@ bool isValidUTF8(std::string_view bytes) {
 
 std::size_t utf16Length(std::string_view text) {
   const auto* s = reinterpret_cast<const uint8_t*>(text.data());
-  const auto length = static_cast<int32_t>(text.size());
+  const auto length = static_cast<std::int64_t>(text.size());
   std::size_t units = 0;
-  for (int32_t i = 0; i < length;) {
+  for (std::int64_t i = 0; i < length;) {
     if (s[i] < 0x80) {
       ++units;
       ++i;

@@ -1,11 +1,13 @@
 #include <gtest/gtest.h>
 #include <openssl/evp.h>
 #include <unicode/locid.h>
+#include <unicode/utf8.h>
 
 #include <cstdint>
 #include <optional>
 #include <random>
 #include <string>
+#include <vector>
 
 #include "kivi/foundation/base64.h"
 #include "kivi/foundation/sha256.h"
@@ -84,6 +86,31 @@ TEST(UnicodeTextTest, TrimsTheUnicodeWhitespaceSetOnly) {
       {"\xff \xfe", "\xff \xfe"},  {" \v\f ", ""},
   };
   for (const auto& [text, trimmed] : cases) EXPECT_EQ(unicode::trim(text), trimmed) << text;
+
+  // Against a forward reading of the whole text (ICU's U8_NEXT, malformed
+  // bytes as U+FFFD-like negatives): trimming from the back must stop at the
+  // same characters, whatever truncated or stray bytes sit there.
+  const std::string_view pieces[] = {" ",      "\t",   "\u0085",   "\u2028", "\u3000", "a",
+                                     "\u00e9", "\x80", "\xe2\x80", "\xe3",   "\xa8"};
+  std::mt19937 rng(2028);
+  for (int round = 0; round < 20000; ++round) {
+    std::string text;
+    for (int n = rng() % 7; n > 0; --n) text += pieces[rng() % std::size(pieces)];
+    std::vector<std::pair<std::size_t, bool>> chars;  // start, is white space
+    const auto* bytes = reinterpret_cast<const std::uint8_t*>(text.data());
+    for (std::int32_t i = 0, length = static_cast<std::int32_t>(text.size()); i < length;) {
+      const std::int32_t start = i;
+      UChar32 c;
+      U8_NEXT(bytes, i, length, c);
+      chars.emplace_back(start, c >= 0 && unicode::isWhitespaceOrNewline(static_cast<char32_t>(c)));
+    }
+    std::size_t first = 0, last = chars.size();
+    while (first < last && chars[first].second) ++first;
+    while (last > first && chars[last - 1].second) --last;
+    const std::size_t begin = first < chars.size() ? chars[first].first : text.size();
+    const std::size_t end = last < chars.size() ? chars[last].first : text.size();
+    ASSERT_EQ(unicode::trimView(text), text.substr(begin, end - begin)) << round;
+  }
 }
 
 TEST(UnicodeTextTest, ComparesIgnoringCaseAndCanonicalForm) {
