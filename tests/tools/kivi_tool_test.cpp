@@ -2,6 +2,7 @@
 // code, and what lands on standard output and standard error.
 #include <sys/wait.h>
 
+#include <cstdio>
 #include <cstdlib>
 #include <fstream>
 #include <sstream>
@@ -31,14 +32,17 @@ std::string slurp(const std::string& path) {
 }
 
 ToolRun kivi(const std::vector<std::string>& args, const std::string& input = "") {
-  const std::string dir = ::testing::TempDir();
-  std::ofstream(dir + "kivi_in") << input;
+  // ctest runs test cases as parallel processes: one set of files each.
+  const std::string base = ::testing::TempDir() + "kivi_" + std::to_string(::getpid()) + "_";
+  std::ofstream(base + "in") << input;
   std::string command = quoted(KIVI_TOOL_PATH);
   for (const auto& arg : args) command += " " + quoted(arg);
-  command += " <" + dir + "kivi_in >" + dir + "kivi_out 2>" + dir + "kivi_err";
+  command += " <" + base + "in >" + base + "out 2>" + base + "err";
   const int status = std::system(command.c_str());
-  return {WIFEXITED(status) ? WEXITSTATUS(status) : -1, slurp(dir + "kivi_out"),
-          slurp(dir + "kivi_err")};
+  ToolRun run{WIFEXITED(status) ? WEXITSTATUS(status) : -1, slurp(base + "out"),
+              slurp(base + "err")};
+  for (const char* name : {"in", "out", "err"}) std::remove((base + name).c_str());
+  return run;
 }
 
 TEST(KiviToolTest, GetClassifiesEachAnswerAndExitsWithItsStatus) {
