@@ -37,15 +37,9 @@ TEST(Format, IntegersMatchTheCLibrary) {
                                "% d",    "%.3d",   "%.0d",  "%8.3d", "%u",   "%x",
                                "%#x",    "%X",     "%#X",   "%o",    "%#o",  "%#.3o",
                                "%08.3x", "%-#8x|", "%+05d", "%+.0d", "%#.0o"};
-  const long long values[] = {0,
-                              1,
-                              -1,
-                              42,
-                              -42,
-                              255,
-                              1'000'000,
-                              std::numeric_limits<int64_t>::min(),
-                              std::numeric_limits<int64_t>::max()};
+  constexpr long long kMin = std::numeric_limits<int64_t>::min();
+  constexpr long long kMax = std::numeric_limits<int64_t>::max();
+  const long long values[] = {0, 1, -1, 42, -42, 255, 1'000'000, kMin, kMax};
   for (const char* conversion : conversions) {
     for (long long v : values) {
       EXPECT_EQ(format(conversion, v), printfReference(conversion, v)) << conversion << " " << v;
@@ -73,7 +67,7 @@ TEST(Format, FloatsMatchTheCLibrary) {
   EXPECT_EQ(format("%.2f", 1.0f), "1.00");
 }
 
-TEST(Format, StringsObjectsAndPointers) {
+TEST(Format, StringsObjectsPointersPositionsAndStars) {
   auto described = std::make_shared<Described>();
   std::shared_ptr<Described> nullObject;
   const char* nullString = nullptr;
@@ -97,13 +91,7 @@ TEST(Format, StringsObjectsAndPointers) {
       {format("%c%c%C%c", 'a', 0xe9, 0x1F600, -1), "a\u00e9\U0001F600\uFFFD"},
       {format("%3c|%-3c|", 'x', 'y'), "  x|y  |"},
       {format("%%|%5%|%"), "%|%|%"},
-  };
-  for (const auto& [actual, expected] : cases) EXPECT_EQ(actual, expected);
-  EXPECT_EQ(format("%p", described), format("%p", static_cast<const void*>(described.get())));
-}
-
-TEST(Format, PositionsAndStars) {
-  const std::pair<std::string, std::string> cases[] = {
+      // Numbered arguments and "*" widths and precisions.
       {format("%2$s %1$s %2$s", "a", "b"), "b a b"},
       {format("%1$d %d %d", 1, 2), "1 1 2"},  // numbered ones do not move the sequence
       {format("%*d|%-*d|%.*f", 4, 1, 4, 2, 2, 3.14159), "   1|2   |3.14"},
@@ -112,6 +100,7 @@ TEST(Format, PositionsAndStars) {
       {format("%.*s", 2u, "abc"), "ab"},
   };
   for (const auto& [actual, expected] : cases) EXPECT_EQ(actual, expected);
+  EXPECT_EQ(format("%p", described), format("%p", static_cast<const void*>(described.get())));
 }
 
 TEST(Format, BadInputIsMarkedInTheText) {
@@ -131,9 +120,7 @@ TEST(Format, BadInputIsMarkedInTheText) {
       {format("100%"), "100%"},
       {format("50%-5"), "50%-5"},
       {format("%d", 1, 2, "extra"), "1"},
-      {format(std::string_view("a\0%d", 4), 5), std::string("a\0"
-                                                            "5",
-                                                            3)},
+      {format(std::string_view("a\0%d", 4), 5), std::string("a\0005", 3)},  // "a", NUL, "5"
   };
   for (const auto& [actual, expected] : cases) EXPECT_EQ(actual, expected);
   EXPECT_EQ(count, 0);
