@@ -186,7 +186,10 @@ void Operation::didFinish() {
     }
   }
   if (completion) WorkerPool::shared().submit(std::move(completion));
-  if (core) core->operationFinished(*this);
+  if (!core || core->operationFinished(*this)) deliverFinish();
+}
+
+void Operation::deliverFinish() {
   finishDelivered_.store(true, std::memory_order_release);
   finishDelivered_.notify_all();
 }

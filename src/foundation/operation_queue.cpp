@@ -73,13 +73,13 @@ void QueueCore::readinessChanged(Operation& operation) {
   launchDrainers(drainers);
 }
 
-void QueueCore::operationFinished(Operation& operation) {
+bool QueueCore::operationFinished(Operation& operation) {
   if (tDrainCore == this && tDrainOperation == &operation) {
     // Finished inside the start() that a drain job of ours is running: the
     // job takes it out of the queue as soon as start() returns, in the same
     // locked section in which it looks for the next operation.
     tDrainOperationFinished = true;
-    return;
+    return false;
   }
   Retired retired;
   std::size_t drainers = 0;
@@ -88,6 +88,12 @@ void QueueCore::operationFinished(Operation& operation) {
     drainers = retireLocked(operation, retired);
   }
   launchDrainers(drainers);
+  return true;
+}
+
+void QueueCore::settle(Retired& retired) {
+  if (retired.deliverFinish) retired.operation->deliverFinish();
+  retired = {};
 }
 
 std::size_t QueueCore::retireLocked(Operation& operation, Retired& retired) {
@@ -127,8 +133,8 @@ void QueueCore::launchDrainers(std::size_t count) {
 
 void QueueCore::drain() {
   tDrainCore = this;
-  Retired retired;          // references to drop once the lock is released
-  std::size_t drainers = 0; // likewise, drain jobs to launch
+  Retired retired;           // references to drop once the lock is released
+  std::size_t drainers = 0;  // likewise, drain jobs to launch
   std::unique_lock lock(mutex);
   for (;;) {
     OperationPtr operation;
@@ -149,7 +155,7 @@ void QueueCore::drain() {
     slot.started = true;
     operation->queueStarted_.store(true, std::memory_order_release);
     lock.unlock();
-    retired = {};
+    settle(retired);
     launchDrainers(std::exchange(drainers, 0));
     tDrainOperation = operation.get();
     tDrainOperationFinished = false;
@@ -158,10 +164,12 @@ void QueueCore::drain() {
     lock.lock();
     ++searching;
     if (tDrainOperationFinished) drainers = retireLocked(*operation, retired);
+    retired.deliverFinish = tDrainOperationFinished;
     retired.operation = std::move(operation);
   }
   lock.unlock();
   tDrainCore = nullptr;
+  settle(retired);
   launchDrainers(drainers);
 }
 

@@ -66,7 +66,10 @@ struct QueueCore : std::enable_shared_from_this<QueueCore> {
   // False when refused.
   bool add(const OperationPtr& operation);
   void readinessChanged(Operation& operation);
-  void operationFinished(Operation& operation);
+  // Takes a finished operation out of the queue. False when that is left to
+  // the drain job whose start() call it finished in: the job retires it when
+  // start() returns and then delivers the finish to waiters itself.
+  bool operationFinished(Operation& operation);
   // Under mutex: how many drain jobs to launch now (counted as searching).
   std::size_t drainersNeededLocked();
   // References that leave the queue with a finished operation; dropped
@@ -75,7 +78,10 @@ struct QueueCore : std::enable_shared_from_this<QueueCore> {
     OperationPtr operation;
     OperationPtr held;
     std::shared_ptr<QueueCore> keeper;
+    bool deliverFinish = false;  // `operation`'s finish waits for its retirement
   };
+  // Outside mutex: delivers a deferred finish, then drops the references.
+  static void settle(Retired& retired);
   // Under mutex: takes a finished operation out of the queue. Returns the
   // drain jobs to launch.
   std::size_t retireLocked(Operation& operation, Retired& retired);

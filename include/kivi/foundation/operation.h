@@ -98,6 +98,8 @@ class Operation : public Object {
   friend class detail::SlotList;
 
   void didFinish();
+  // Marks the finish as complete (its queue has let go) and wakes waiters.
+  void deliverFinish();
   std::shared_ptr<detail::QueueCore> queueCore() const;
 
   mutable std::mutex mutex_;
