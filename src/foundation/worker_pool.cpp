@@ -59,19 +59,21 @@ bool WorkerPool::isWorkerThread() noexcept { return tIsWorker; }
 
 void WorkerPool::submit(std::function<void()> job) {
   State& s = *state_;
-  bool spawn = false;
+  bool spawn = false, wake = false;
   {
     std::lock_guard lock(s.mutex);
     s.jobs.push_back(std::move(job));
     // Wake an idle worker while there are at least as many idle workers as
     // queued jobs; otherwise make a new thread.
     if (s.jobs.size() <= s.idle) {
-      s.wake.notify_one();
+      wake = true;
     } else if (s.threads < kMaxThreads) {
       ++s.threads;
       spawn = true;
     }
   }
+  // Woken after the unlock, the worker does not run straight into our lock.
+  if (wake) s.wake.notify_one();
   if (spawn) std::thread([&s] { s.run(); }).detach();
 }
 
