@@ -75,8 +75,14 @@ class GetOperation : public KivJSONAPIOperation {
   void didCompleteUrlRequest(const URLRequest& request, const std::optional<Data>& data,
                              HTTPURLResponsePtr response, ErrorPtr error) override {
     if (response) {
+      // An answer whose redacted URL does not parse again comes back as it
+      // was: then only its status code and the redacted URL text are logged.
+      const HTTPURLResponsePtr redacted = KivSdkResponseForLogging(response);
       logger().logInfo(nullptr, __FILE__, __func__, __LINE__,
-                       "answer: " + KivSdkResponseForLogging(response)->description());
+                       redacted != response
+                           ? "answer: " + redacted->description()
+                           : "answer: HTTP " + std::to_string(response->statusCode()) + " from " +
+                                 loggable(response->URL()) + " (headers withheld)");
     } else if (error) {
       logger().logInfo(nullptr, __FILE__, __func__, __LINE__,
                        "no answer from " + loggable(request.URL()) + ": " + error->domain() + " " +
