@@ -34,7 +34,8 @@ std::string trim(std::string_view text);
 
 // True when the two texts are equal ignoring case (full default case folding)
 // and canonical equivalence: a precomposed letter equals its decomposed form.
-// Independent of the locale. No trimming.
+// Independent of the locale. No trimming. A text over 2 GiB (beyond ICU's
+// lengths) equals only the same bytes, here and in canonicalEquals.
 bool caseInsensitiveEquals(std::string_view a, std::string_view b);
 
 // True when the two texts are canonically equivalent (equal after NFD).
