@@ -64,7 +64,7 @@ class GetOperation : public KivJSONAPIOperation {
       changed.setTimeoutInterval(*options_.timeout);
       request = URLRequest(changed);
     }
-    if (request) {
+    if (request && verboseLoggingEnabled()) {
       logger().logInfo(nullptr, __FILE__, __func__, __LINE__,
                        "sending " + request->HTTPMethod() + " " + loggable(request->URL()));
     }
@@ -74,20 +74,7 @@ class GetOperation : public KivJSONAPIOperation {
   // Keeps the body for printing, whatever the operation decides.
   void didCompleteUrlRequest(const URLRequest& request, const std::optional<Data>& data,
                              HTTPURLResponsePtr response, ErrorPtr error) override {
-    if (response) {
-      // An answer whose redacted URL does not parse again comes back as it
-      // was: then only its status code and the redacted URL text are logged.
-      const HTTPURLResponsePtr redacted = KivSdkResponseForLogging(response);
-      logger().logInfo(nullptr, __FILE__, __func__, __LINE__,
-                       redacted != response
-                           ? "answer: " + redacted->description()
-                           : "answer: HTTP " + std::to_string(response->statusCode()) + " from " +
-                                 loggable(response->URL()) + " (headers withheld)");
-    } else if (error) {
-      logger().logInfo(nullptr, __FILE__, __func__, __LINE__,
-                       "no answer from " + loggable(request.URL()) + ": " + error->domain() + " " +
-                           std::to_string(error->code()));
-    }
+    if (verboseLoggingEnabled()) logOutcome(request, response, error);
     body = data.value_or(Data{});
     KivJSONAPIOperation::didCompleteUrlRequest(request, data, std::move(response),
                                                std::move(error));
@@ -108,6 +95,25 @@ class GetOperation : public KivJSONAPIOperation {
   Data body;  // written before completion, read after it
 
  private:
+  // The answer (or the failure) as the verbose log shows it, redacted.
+  static void logOutcome(const URLRequest& request, const HTTPURLResponsePtr& response,
+                         const ErrorPtr& error) {
+    if (response) {
+      // An answer whose redacted URL does not parse again comes back as it
+      // was: then only its status code and the redacted URL text are logged.
+      const HTTPURLResponsePtr redacted = KivSdkResponseForLogging(response);
+      logger().logInfo(nullptr, __FILE__, __func__, __LINE__,
+                       redacted != response
+                           ? "answer: " + redacted->description()
+                           : "answer: HTTP " + std::to_string(response->statusCode()) + " from " +
+                                 loggable(response->URL()) + " (headers withheld)");
+    } else if (error) {
+      logger().logInfo(nullptr, __FILE__, __func__, __LINE__,
+                       "no answer from " + loggable(request.URL()) + ": " + error->domain() + " " +
+                           std::to_string(error->code()));
+    }
+  }
+
   const GetOptions options_;
 };
 

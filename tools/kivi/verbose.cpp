@@ -89,6 +89,8 @@ KivSwiftSdkLogger& logger() {
   return instance;
 }
 
+bool verboseLoggingEnabled() { return verboseDelegate() != nullptr; }
+
 void enableVerboseLogging(std::ostream& err) {
   verboseDelegate() = std::make_shared<StreamDelegate>(err);
   logger().setLoggerDelegate(verboseDelegate());

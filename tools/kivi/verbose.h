@@ -27,6 +27,10 @@ namespace kivi::tool {
 // The tool's logger; its default module is "kivi".
 KivSwiftSdkLogger& logger();
 
+// Whether enableVerboseLogging() was called: lets a command skip building
+// log text that would be dropped.
+bool verboseLoggingEnabled();
+
 // Sends every line of logger() to `err` from now on. `err` must outlive all
 // logging.
 void enableVerboseLogging(std::ostream& err);
