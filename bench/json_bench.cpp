@@ -29,7 +29,7 @@
 #include <string>
 #include <string_view>
 
-#include "kivi/foundation/json_serialization.h"
+#include "kivi/text/json_serialization.h"
 
 namespace {
 

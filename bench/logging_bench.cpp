@@ -23,7 +23,7 @@
 #include <string>
 #include <string_view>
 
-#include "kivi/foundation/format.h"
+#include "kivi/text/format.h"
 #include "kivi/logging/kiv_sdk_logger.h"
 #include "kivi/logging/kiv_swift_sdk_logger.h"
 

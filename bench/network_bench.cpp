@@ -56,12 +56,12 @@
 #include <thread>
 #include <vector>
 
-#include "kivi/foundation/operation_queue.h"
-#include "kivi/foundation/url.h"
-#include "kivi/foundation/url_session.h"
+#include "kivi/dispatch/operation_queue.h"
+#include "kivi/net/url.h"
+#include "kivi/net/url_session.h"
 #include "kivi/operations/kiv_async_service.h"
 #include "kivi/operations/kiv_json_api_operation.h"
-#include "kivi/operations/operation_queue_protocol.h"
+#include "kivi/dispatch/operation_queue_protocol.h"
 
 namespace kivi {
 namespace {

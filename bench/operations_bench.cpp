@@ -42,7 +42,7 @@
 
 #include "kivi/operations/kiv_async_operation.h"
 #include "kivi/operations/kiv_async_service.h"
-#include "kivi/operations/operation_queue_protocol.h"
+#include "kivi/dispatch/operation_queue_protocol.h"
 
 namespace kivi {
 namespace {

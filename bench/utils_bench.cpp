@@ -19,7 +19,7 @@
 #include <random>
 #include <string>
 
-#include "kivi/foundation/base64.h"
+#include "kivi/text/base64.h"
 #include "kivi/utils/kiv_utils.h"
 
 namespace {

@@ -14,8 +14,8 @@
 #include <string_view>
 
 #include "fuzz_check.h"
-#include "kivi/foundation/base64.h"
-#include "kivi/foundation/unicode_text.h"
+#include "kivi/text/base64.h"
+#include "kivi/text/unicode_text.h"
 #include "kivi/utils/kiv_utils.h"
 
 using kivi::fuzz::check;

@@ -18,8 +18,8 @@
 #include <vector>
 
 #include "fuzz_check.h"
-#include "kivi/foundation/format.h"
-#include "kivi/foundation/unicode_text.h"
+#include "kivi/text/format.h"
+#include "kivi/text/unicode_text.h"
 #include "kivi/logging/kiv_sdk_logger.h"
 
 using kivi::fuzz::check;

@@ -18,7 +18,7 @@
 #include <string_view>
 
 #include "fuzz_check.h"
-#include "kivi/foundation/json_serialization.h"
+#include "kivi/text/json_serialization.h"
 
 using kivi::fuzz::check;
 

@@ -9,8 +9,8 @@
 #include <string_view>
 
 #include "fuzz_check.h"
-#include "kivi/foundation/url.h"
-#include "kivi/foundation/url_components.h"
+#include "kivi/net/url.h"
+#include "kivi/net/url_components.h"
 #include "kivi/utils/url_utils.h"
 
 using kivi::fuzz::check;

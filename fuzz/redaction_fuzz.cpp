@@ -18,9 +18,9 @@
 #include <vector>
 
 #include "fuzz_check.h"
-#include "kivi/foundation/http_cookie.h"
-#include "kivi/foundation/unicode_text.h"
-#include "kivi/foundation/url_components.h"
+#include "kivi/net/http_cookie.h"
+#include "kivi/text/unicode_text.h"
+#include "kivi/net/url_components.h"
 #include "kivi/logging/kiv_obfuscator.h"
 #include "kivi/logging/log_redaction.h"
 #include "kivi/utils/url_utils.h"

@@ -10,8 +10,8 @@
 #include <string_view>
 
 #include "fuzz_check.h"
-#include "kivi/foundation/json_serialization.h"
-#include "kivi/foundation/unicode_text.h"
+#include "kivi/text/json_serialization.h"
+#include "kivi/text/unicode_text.h"
 #include "kivi/utils/dictionary_utils.h"
 
 using kivi::fuzz::check;

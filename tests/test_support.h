@@ -15,7 +15,7 @@
 #include <utility>
 #include <vector>
 
-#include "kivi/foundation/object.h"
+#include "kivi/base/object.h"
 
 namespace kivi {
 

@@ -3,8 +3,8 @@
 #include <algorithm>
 #include <cstddef>
 
-#include "kivi/foundation/regular_expression.h"
-#include "kivi/foundation/unicode_text.h"
+#include "kivi/text/regular_expression.h"
+#include "kivi/text/unicode_text.h"
 
 namespace kivi {
 namespace detail {

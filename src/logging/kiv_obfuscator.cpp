@@ -3,7 +3,7 @@
 #include <algorithm>
 #include <new>
 
-#include "kivi/foundation/unicode_text.h"
+#include "kivi/text/unicode_text.h"
 
 namespace kivi {
 

@@ -6,7 +6,7 @@
 #include <string_view>
 #include <thread>
 
-#include "kivi/foundation/unicode_text.h"
+#include "kivi/text/unicode_text.h"
 
 namespace kivi {
 namespace {

@@ -2,9 +2,9 @@
 
 #include <algorithm>
 
-#include "kivi/foundation/http_cookie.h"
-#include "kivi/foundation/unicode_text.h"
-#include "kivi/foundation/url_components.h"
+#include "kivi/net/http_cookie.h"
+#include "kivi/text/unicode_text.h"
+#include "kivi/net/url_components.h"
 
 namespace kivi {
 

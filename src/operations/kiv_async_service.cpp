@@ -2,7 +2,7 @@
 
 #include <mutex>
 
-#include "kivi/foundation/operation_queue.h"
+#include "kivi/dispatch/operation_queue.h"
 
 namespace kivi {
 

@@ -2,7 +2,7 @@
 
 #include <algorithm>
 
-#include "kivi/foundation/url_components.h"
+#include "kivi/net/url_components.h"
 #include "kivi/utils/url_utils.h"
 
 namespace kivi {

@@ -4,8 +4,8 @@
 #include <cstdint>
 #include <utility>
 
-#include "kivi/foundation/json_serialization.h"
-#include "kivi/foundation/unicode_text.h"
+#include "kivi/text/json_serialization.h"
+#include "kivi/text/unicode_text.h"
 
 namespace kivi {
 namespace {

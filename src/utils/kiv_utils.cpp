@@ -3,9 +3,9 @@
 #include <algorithm>
 #include <array>
 
-#include "kivi/foundation/base64.h"
-#include "kivi/foundation/sha256.h"
-#include "kivi/foundation/unicode_text.h"
+#include "kivi/text/base64.h"
+#include "kivi/text/sha256.h"
+#include "kivi/text/unicode_text.h"
 
 namespace kivi::KivUtils {
 namespace {

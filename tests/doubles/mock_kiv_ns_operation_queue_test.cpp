@@ -7,7 +7,7 @@
 #include <string_view>
 #include <vector>
 
-#include "kivi/foundation/operation.h"
+#include "kivi/dispatch/operation.h"
 
 namespace kivi {
 namespace {

@@ -5,7 +5,7 @@
 #include <string>
 #include <vector>
 
-#include "kivi/foundation/url_components.h"
+#include "kivi/net/url_components.h"
 #include "kivi/logging/log_redaction.h"
 #include "kivi/utils/url_utils.h"
 

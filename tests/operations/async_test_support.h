@@ -10,7 +10,7 @@
 #include <string>
 #include <utility>
 
-#include "kivi/foundation/worker_pool.h"
+#include "kivi/dispatch/worker_pool.h"
 #include "kivi/operations/kiv_async_operation.h"
 #include "test_support.h"
 

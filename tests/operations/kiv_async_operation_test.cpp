@@ -12,8 +12,8 @@
 #include <thread>
 #include <vector>
 
-#include "kivi/foundation/error.h"
-#include "kivi/foundation/operation_queue.h"
+#include "kivi/base/error.h"
+#include "kivi/dispatch/operation_queue.h"
 #include "operations/async_test_support.h"
 
 namespace kivi {

@@ -10,7 +10,7 @@
 #include <vector>
 
 #include "kivi/doubles/mock_kiv_ns_operation_queue.h"
-#include "kivi/foundation/operation_queue.h"
+#include "kivi/dispatch/operation_queue.h"
 #include "operations/async_test_support.h"
 
 namespace kivi {

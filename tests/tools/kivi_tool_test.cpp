@@ -7,7 +7,7 @@
 #include <fstream>
 #include <sstream>
 
-#include "network/test_servers.h"
+#include "test_servers.h"
 
 namespace kivi {
 namespace {

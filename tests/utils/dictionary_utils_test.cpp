@@ -9,7 +9,7 @@
 #include <string_view>
 #include <utility>
 
-#include "kivi/foundation/json_serialization.h"
+#include "kivi/text/json_serialization.h"
 #include "test_support.h"
 
 namespace kivi {

@@ -13,10 +13,10 @@
 #include <thread>
 
 #include "command.h"
-#include "kivi/foundation/error.h"
-#include "kivi/foundation/json_serialization.h"
-#include "kivi/foundation/url_session.h"
-#include "kivi/foundation/worker_pool.h"
+#include "kivi/base/error.h"
+#include "kivi/text/json_serialization.h"
+#include "kivi/net/url_session.h"
+#include "kivi/dispatch/worker_pool.h"
 #include "kivi/operations/kiv_async_operation.h"
 #include "kivi/operations/kiv_async_service.h"
 #include "kivi/operations/kiv_json_api_operation.h"

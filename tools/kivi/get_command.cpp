@@ -4,7 +4,7 @@
 #include <ostream>
 
 #include "command.h"
-#include "kivi/foundation/json_serialization.h"
+#include "kivi/text/json_serialization.h"
 #include "kivi/logging/log_redaction.h"
 #include "kivi/operations/kiv_async_service.h"
 #include "kivi/operations/kiv_json_api_operation.h"

@@ -6,7 +6,7 @@
 #include <ostream>
 
 #include "command.h"
-#include "kivi/foundation/unicode_text.h"
+#include "kivi/text/unicode_text.h"
 #include "kivi/launch/kiv_ulo_file_parser.h"
 
 namespace kivi::tool {

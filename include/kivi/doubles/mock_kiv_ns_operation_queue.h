@@ -19,8 +19,8 @@
 #include <string>
 #include <vector>
 
-#include "kivi/foundation/object.h"
-#include "kivi/operations/operation_queue_protocol.h"
+#include "kivi/base/object.h"
+#include "kivi/dispatch/operation_queue_protocol.h"
 
 namespace kivi {
 

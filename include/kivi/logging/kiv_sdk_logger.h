@@ -2,7 +2,7 @@
 // call on its KivSdkLoggerDelegate.
 //
 // The caller gives the file and function names as C strings and the message
-// as a printf-style format with typed arguments (see kivi/foundation/format.h:
+// as a printf-style format with typed arguments (see kivi/text/format.h:
 // %@ prints a Value's or Object's description); the level picks the delegate
 // method.
 //
@@ -42,8 +42,8 @@
 #include <string>
 #include <string_view>
 
-#include "kivi/foundation/format.h"
-#include "kivi/foundation/object.h"
+#include "kivi/text/format.h"
+#include "kivi/base/object.h"
 #include "kivi/logging/kiv_sdk_logger_delegate.h"
 
 namespace kivi {

@@ -29,10 +29,10 @@
 #include <string>
 #include <vector>
 
-#include "kivi/foundation/http_url_response.h"
-#include "kivi/foundation/url.h"
-#include "kivi/foundation/url_request.h"
-#include "kivi/foundation/value.h"
+#include "kivi/net/http_url_response.h"
+#include "kivi/net/url.h"
+#include "kivi/net/url_request.h"
+#include "kivi/base/value.h"
 
 namespace kivi {
 

@@ -49,8 +49,8 @@
 #include <string>
 #include <string_view>
 
-#include "kivi/foundation/error.h"
-#include "kivi/foundation/operation.h"
+#include "kivi/base/error.h"
+#include "kivi/dispatch/operation.h"
 
 namespace kivi {
 

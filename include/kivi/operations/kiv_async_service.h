@@ -34,10 +34,10 @@
 #include <memory>
 #include <string>
 
-#include "kivi/foundation/object.h"
-#include "kivi/foundation/operation.h"
-#include "kivi/foundation/recursive_lock.h"
-#include "kivi/operations/operation_queue_protocol.h"
+#include "kivi/base/object.h"
+#include "kivi/dispatch/operation.h"
+#include "kivi/base/recursive_lock.h"
+#include "kivi/dispatch/operation_queue_protocol.h"
 
 namespace kivi {
 

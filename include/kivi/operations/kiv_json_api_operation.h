@@ -58,7 +58,7 @@
 #include <optional>
 #include <string>
 
-#include "kivi/foundation/json_serialization.h"
+#include "kivi/text/json_serialization.h"
 #include "kivi/operations/kiv_url_session_task_operation.h"
 
 namespace kivi {

@@ -23,9 +23,9 @@
 #include <mutex>
 #include <optional>
 
-#include "kivi/foundation/http_url_response.h"
-#include "kivi/foundation/url_request.h"
-#include "kivi/foundation/url_session.h"
+#include "kivi/net/http_url_response.h"
+#include "kivi/net/url_request.h"
+#include "kivi/net/url_session.h"
 #include "kivi/operations/kiv_async_operation.h"
 
 namespace kivi {

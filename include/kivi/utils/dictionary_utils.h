@@ -36,10 +36,10 @@
 #include <string>
 #include <string_view>
 
-#include "kivi/foundation/date_formatter.h"
-#include "kivi/foundation/error.h"
-#include "kivi/foundation/url.h"
-#include "kivi/foundation/value.h"
+#include "kivi/text/date_formatter.h"
+#include "kivi/base/error.h"
+#include "kivi/net/url.h"
+#include "kivi/base/value.h"
 
 namespace kivi {
 

@@ -44,7 +44,7 @@
 #include <unordered_set>
 #include <vector>
 
-#include "kivi/foundation/value.h"
+#include "kivi/base/value.h"
 
 namespace kivi::KivUtils {
 
@@ -73,7 +73,7 @@ std::optional<std::vector<std::string>> trimmedCommponentsSeparatedByString(
 // the string is not valid UTF-8.
 std::optional<std::string> encodeIntoBase64String(std::string_view string);
 
-// The text that strict standard base64 encodes (see kivi/foundation/base64.h);
+// The text that strict standard base64 encodes (see kivi/text/base64.h);
 // null when the string is not such base64 or the bytes are not valid UTF-8.
 std::optional<std::string> decodeFromBase64String(std::string_view string);
 

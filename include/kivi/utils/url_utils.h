@@ -33,10 +33,10 @@
 #include <string_view>
 #include <vector>
 
-#include "kivi/foundation/http_cookie.h"
-#include "kivi/foundation/url.h"
-#include "kivi/foundation/url_components.h"
-#include "kivi/foundation/url_request.h"
+#include "kivi/net/http_cookie.h"
+#include "kivi/net/url.h"
+#include "kivi/net/url_components.h"
+#include "kivi/net/url_request.h"
 
 namespace kivi {
 

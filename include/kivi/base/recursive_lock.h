@@ -1,0 +1,39 @@
+// RecursiveLock: a mutual-exclusion lock that the thread holding it may take
+// again; each lock() needs its unlock(). Usable with std::lock_guard and
+// std::unique_lock.
+//
+//   auto lock = std::make_shared<kivi::RecursiveLock>();
+//   std::lock_guard guard(*lock);
+//
+// Thread contract: any thread; unlock() only by the holding thread.
+#pragma once
+
+#include <mutex>
+#include <string>
+
+#include "kivi/base/object.h"
+
+namespace kivi {
+
+class RecursiveLock : public Object {
+ public:
+  RecursiveLock() = default;
+
+  void lock() { mutex_.lock(); }
+  void unlock() { mutex_.unlock(); }
+  bool tryLock() { return mutex_.try_lock(); }
+  // BasicLockable / Lockable spellings.
+  bool try_lock() { return tryLock(); }
+
+  std::string name() const;
+  void setName(std::string name);
+
+  std::string className() const override { return "NSRecursiveLock"; }
+
+ private:
+  std::recursive_mutex mutex_;
+  mutable std::mutex nameMutex_;
+  std::string name_;  // guarded by nameMutex_
+};
+
+}  // namespace kivi

@@ -1,0 +1,150 @@
+// Operation: one unit of work with a Ready / Executing / Finished life cycle,
+// run by an OperationQueue or started by hand.
+//
+// A synchronous operation overrides main(); the base start() runs it and
+// finishes the operation. An asynchronous operation overrides start(),
+// isAsynchronous(), isExecuting() and isFinished(), and announces its own
+// transitions with willChangeValueForKey / didChangeValueForKey of
+// "isExecuting" and "isFinished" (kivi::KivAsyncOperation does this for you).
+//
+// Readiness: an operation is ready when all its dependencies have finished,
+// or when it is cancelled. Subclasses may narrow isReady() and announce
+// changes to it under the key "isReady"; a queue re-reads readiness on each
+// announcement.
+//
+// When the operation announces "isFinished" and isFinished() reads true (the
+// first time only): its dependents are told that their readiness may have
+// changed, its completion block is handed to a worker thread (and cleared),
+// its queue forgets it, and waitUntilFinished() returns.
+//
+//   auto op = std::make_shared<kivi::BlockOperation>([] { work(); });
+//   op->setCompletionBlock([] { done(); });
+//   queue->addOperation(op);
+//
+// Thread contract: every member may be called from any thread. Notifications
+// are delivered on the thread that makes the change. An operation must be
+// owned by a std::shared_ptr to be queued, to have dependents or to be
+// observed.
+#pragma once
+
+#include <atomic>
+#include <cstdint>
+#include <functional>
+#include <memory>
+#include <mutex>
+#include <string>
+#include <vector>
+
+#include "kivi/base/object.h"
+
+namespace kivi {
+
+namespace detail {
+struct QueueCore;
+class SlotList;
+}  // namespace detail
+
+class Operation;
+using OperationPtr = std::shared_ptr<Operation>;
+
+class Operation : public Object {
+ public:
+  Operation() = default;
+  ~Operation() override;
+
+  // Base behaviour for a synchronous operation: refused (ignored) when
+  // already started, executing or finished, or when not ready and not
+  // cancelled. Otherwise, unless cancelled, moves to executing and runs
+  // main(); then finishes. For an asynchronous operation it does nothing:
+  // such an operation's own start() does the work and owns the state.
+  virtual void start();
+  // The work of a synchronous operation. Does nothing by default.
+  virtual void main();
+  // Sets the cancelled flag (announced as "isCancelled") and, if unfinished,
+  // announces "isReady": a cancelled operation is ready.
+  virtual void cancel();
+
+  virtual bool isCancelled() const;
+  virtual bool isExecuting() const;
+  virtual bool isFinished() const;
+  virtual bool isAsynchronous() const;
+  virtual bool isReady() const;
+  bool isConcurrent() const { return isAsynchronous(); }
+
+  // Dependencies are held strongly. Adding or removing one announces
+  // "isReady". Adding the operation itself, or null, is ignored.
+  void addDependency(const OperationPtr& operation);
+  void removeDependency(const OperationPtr& operation);
+  std::vector<OperationPtr> dependencies() const;
+
+  std::function<void()> completionBlock() const;
+  void setCompletionBlock(std::function<void()> block);
+
+  std::string name() const;
+  void setName(std::string name);
+
+  // Blocks until the operation has finished.
+  void waitUntilFinished();
+
+  // "isReady", "isExecuting", "isFinished", "isCancelled", "isAsynchronous",
+  // "isConcurrent" and "name".
+  Value valueForKey(std::string_view key) const override;
+
+ protected:
+  void keyValueDidChange(std::string_view key) override;
+
+ private:
+  friend struct detail::QueueCore;
+  friend class detail::SlotList;
+
+  void didFinish();
+  // Marks the finish as complete (its queue has let go) and wakes waiters.
+  void deliverFinish();
+  std::shared_ptr<detail::QueueCore> queueCore() const;
+
+  mutable std::mutex mutex_;
+  std::vector<OperationPtr> dependencies_;            // guarded by mutex_
+  std::vector<std::weak_ptr<Operation>> dependents_;  // guarded by mutex_
+  std::function<void()> completionBlock_;             // guarded by mutex_
+  std::string name_;                                  // guarded by mutex_
+  std::weak_ptr<detail::QueueCore> queue_;            // guarded by mutex_; set once
+
+  std::atomic<bool> cancelled_{false};
+  std::atomic<bool> baseStarted_{false};
+  std::atomic<bool> baseExecuting_{false};
+  std::atomic<bool> baseFinished_{false};
+  std::atomic<bool> finishHandled_{false};
+  // Set, and waiters woken, once everything finishing entails is done.
+  std::atomic<bool> finishDelivered_{false};
+  std::atomic<bool> cancelAnnounced_{false};
+  std::atomic<bool> queueStarted_{false};
+  std::atomic<bool> enqueued_{false};
+  std::atomic<std::size_t> dependencyCount_{0};  // dependencies_.size()
+
+  // The queue's bookkeeping, guarded by the owning QueueCore's mutex.
+  struct QueueSlot {
+    bool listed = false;   // in the queue's pending or running list
+    bool started = false;  // the queue has called (or is calling) start()
+    bool done = false;     // the queue has seen it finish
+    bool ready = false;    // last readiness the queue read
+    std::uint64_t readyEpoch = 0;
+    std::uint64_t sequence = 0;
+    OperationPtr held;              // the queue's reference while listed
+    Operation* previous = nullptr;  // links of the pending or running list
+    Operation* next = nullptr;
+  } slot_;
+  std::atomic<std::uint64_t> readyEpoch_{0};
+};
+
+// An operation whose work is a function.
+class BlockOperation : public Operation {
+ public:
+  explicit BlockOperation(std::function<void()> block) : block_(std::move(block)) {}
+  void main() override;
+  std::string className() const override { return "NSBlockOperation"; }
+
+ private:
+  std::function<void()> block_;
+};
+
+}  // namespace kivi

@@ -1,0 +1,88 @@
+// URLRequest and MutableURLRequest: an HTTP request to be sent by a
+// URLSession: URL, method, header fields, body and time-out.
+//
+// Header field names are matched without regard to ASCII case: setting
+// "content-type" replaces a "Content-Type" set earlier (the first spelling is
+// kept). allHTTPHeaderFields() gives every field once.
+//
+//   kivi::MutableURLRequest request(url);
+//   request.setHTTPMethod("POST");
+//   request.setValue("application/json", "Content-Type");
+//   request.setHTTPBody(body);
+//   kivi::URLRequest frozen = request;   // an immutable copy
+//
+// A URLSession refuses to send a request whose header names or values hold a
+// CR, LF or NUL character (the task fails with an error; nothing is sent).
+//
+// Thread contract: value types; not synchronised.
+#pragma once
+
+#include <map>
+#include <optional>
+#include <string>
+#include <string_view>
+#include <utility>
+#include <vector>
+
+#include "kivi/net/url.h"
+#include "kivi/base/value.h"
+
+namespace kivi {
+
+// Header fields as a plain dictionary (exact-key lookup).
+using StringDictionary = std::map<std::string, std::string, std::less<>>;
+
+inline constexpr double URLRequestDefaultTimeoutInterval = 60.0;
+
+// Compares two header field names ignoring ASCII case.
+bool headerFieldNamesEqual(std::string_view a, std::string_view b) noexcept;
+
+class URLRequest {
+ public:
+  URLRequest() = default;
+  explicit URLRequest(URLPtr url, double timeoutInterval = URLRequestDefaultTimeoutInterval)
+      : url_(std::move(url)), timeoutInterval_(timeoutInterval) {}
+
+  const URLPtr& URL() const noexcept { return url_; }
+  const std::string& HTTPMethod() const noexcept { return method_; }
+  double timeoutInterval() const noexcept { return timeoutInterval_; }
+  const std::optional<Data>& HTTPBody() const noexcept { return body_; }
+
+  // The value of the field named `field` in any case; none when absent.
+  std::optional<std::string> valueForHTTPHeaderField(std::string_view field) const;
+  StringDictionary allHTTPHeaderFields() const;
+  // The fields in the order they were first set, with their first spelling.
+  const std::vector<std::pair<std::string, std::string>>& headerFields() const noexcept {
+    return fields_;
+  }
+
+  friend bool operator==(const URLRequest&, const URLRequest&) noexcept;
+
+ protected:
+  URLPtr url_;
+  std::string method_ = "GET";
+  double timeoutInterval_ = URLRequestDefaultTimeoutInterval;
+  std::optional<Data> body_;
+  std::vector<std::pair<std::string, std::string>> fields_;
+};
+
+class MutableURLRequest : public URLRequest {
+ public:
+  using URLRequest::URLRequest;
+  MutableURLRequest(const URLRequest& request) : URLRequest(request) {}
+
+  void setURL(URLPtr url) { url_ = std::move(url); }
+  // An empty method means "GET".
+  void setHTTPMethod(std::string method);
+  void setTimeoutInterval(double seconds) { timeoutInterval_ = seconds; }
+  void setHTTPBody(std::optional<Data> body) { body_ = std::move(body); }
+
+  // Sets the field, replacing its value; none removes it.
+  void setValue(std::optional<std::string> value, std::string_view field);
+  // Appends to the field's value, comma-separated, or sets it.
+  void addValue(std::string_view value, std::string_view field);
+  // Replaces every field with `fields`; none removes them all.
+  void setAllHTTPHeaderFields(const std::optional<StringDictionary>& fields);
+};
+
+}  // namespace kivi

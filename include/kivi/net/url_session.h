@@ -1,0 +1,184 @@
+// URLSession: HTTP and HTTPS transfers on libcurl.
+//
+// A session owns one libcurl multi handle: connections are reused between
+// tasks, HTTP/2 is used over TLS where the server offers it, certificates are
+// checked against the system's store, redirects are followed (at most 16), and
+// gzip, deflate and brotli answers are decoded. resume() sends the request on
+// the calling thread as far as the socket takes it; a network thread of the
+// session's own, started with its first task, waits for answers and
+// deadlines. Each task's completion handler runs on the session's delegate
+// queue (a serial OperationQueue unless one is given), never inline on the
+// thread that resumed or cancelled the task.
+//
+//   auto session = kivi::URLSession::sessionWithConfiguration(
+//       kivi::URLSessionConfiguration::defaultSessionConfiguration());
+//   auto task = session->dataTaskWithRequest(request,
+//       [](std::optional<kivi::Data> data, kivi::HTTPURLResponsePtr response,
+//          kivi::ErrorPtr error) { ... });
+//   task->resume();
+//
+// Failures complete the task with an error in URLErrorDomain: cancelled
+// (-999), timed out (-1001: no byte moved for the request's time-out),
+// cannot find host (-1003), cannot connect (-1004), connection lost (-1005),
+// too many redirects (-1007), bad server response (-1011), cannot parse
+// response (-1017), unsupported URL (-1002), secure connection failed
+// (-1200) and others; the user info holds a readable description and the
+// failing URL (URLErrorFailingURLErrorKey, URLErrorFailingURLStringErrorKey).
+// A request whose header names or values hold CR, LF or NUL is not sent: the
+// task fails with URLErrorBadURL and a description naming the field.
+//
+// Thread contract: every member may be called from any thread. Releasing the
+// last reference to a session lets its running tasks finish, then stops its
+// thread; invalidateAndCancel() cancels them instead.
+#pragma once
+
+#include <atomic>
+#include <cstdint>
+#include <functional>
+#include <memory>
+#include <mutex>
+#include <optional>
+
+#include "kivi/base/error.h"
+#include "kivi/net/http_url_response.h"
+#include "kivi/base/object.h"
+#include "kivi/dispatch/operation_queue.h"
+#include "kivi/net/url_request.h"
+
+namespace kivi {
+
+struct URLSessionCore;
+struct Transfer;
+
+inline constexpr const char* URLErrorDomain = "NSURLErrorDomain";
+inline constexpr std::int64_t URLErrorUnknown = -1;
+inline constexpr std::int64_t URLErrorCancelled = -999;
+inline constexpr std::int64_t URLErrorBadURL = -1000;
+inline constexpr std::int64_t URLErrorTimedOut = -1001;
+inline constexpr std::int64_t URLErrorUnsupportedURL = -1002;
+inline constexpr std::int64_t URLErrorCannotFindHost = -1003;
+inline constexpr std::int64_t URLErrorCannotConnectToHost = -1004;
+inline constexpr std::int64_t URLErrorNetworkConnectionLost = -1005;
+inline constexpr std::int64_t URLErrorDNSLookupFailed = -1006;
+inline constexpr std::int64_t URLErrorHTTPTooManyRedirects = -1007;
+inline constexpr std::int64_t URLErrorResourceUnavailable = -1008;
+inline constexpr std::int64_t URLErrorNotConnectedToInternet = -1009;
+inline constexpr std::int64_t URLErrorBadServerResponse = -1011;
+inline constexpr std::int64_t URLErrorZeroByteResource = -1014;
+inline constexpr std::int64_t URLErrorCannotDecodeRawData = -1015;
+inline constexpr std::int64_t URLErrorCannotDecodeContentData = -1016;
+inline constexpr std::int64_t URLErrorCannotParseResponse = -1017;
+inline constexpr std::int64_t URLErrorDataLengthExceedsMaximum = -1103;
+inline constexpr std::int64_t URLErrorSecureConnectionFailed = -1200;
+inline constexpr std::int64_t URLErrorServerCertificateUntrusted = -1202;
+inline constexpr std::int64_t URLErrorClientCertificateRejected = -1205;
+inline constexpr std::int64_t URLErrorCannotLoadFromNetwork = -2000;
+
+struct URLSessionConfiguration {
+  static URLSessionConfiguration defaultSessionConfiguration() { return {}; }
+  static URLSessionConfiguration ephemeralSessionConfiguration() { return {}; }
+
+  // Longest time with no byte moving, for requests whose own time-out is 0
+  // or less (a request's time-out is 60 s unless set).
+  double timeoutIntervalForRequest = 60;
+  // Longest time for a whole transfer.
+  double timeoutIntervalForResource = 7 * 24 * 3600;
+  // Sent with every request that does not set the same field itself.
+  StringDictionary HTTPAdditionalHeaders;
+  std::int64_t HTTPMaximumConnectionsPerHost = 6;
+  // Answers whose header block exceeds this fail with
+  // URLErrorBadServerResponse.
+  std::size_t maximumResponseHeaderBytes = 256 * 1024;
+};
+
+class URLSessionTask : public Object {
+ public:
+  enum class State : std::int64_t { running = 0, suspended = 1, canceling = 2, completed = 3 };
+
+  std::uint64_t taskIdentifier() const noexcept { return identifier_; }
+  const std::optional<URLRequest>& originalRequest() const noexcept { return original_; }
+  State state() const noexcept { return state_; }
+  // Set once the task has completed.
+  HTTPURLResponsePtr response() const;
+  ErrorPtr error() const;
+
+  // Starts a suspended task; does nothing otherwise.
+  virtual void resume();
+  // Ends the task with URLErrorCancelled unless it has completed; the
+  // completion handler runs once either way.
+  virtual void cancel();
+
+  Value valueForKey(std::string_view key) const override;
+
+  ~URLSessionTask() override;
+
+ protected:
+  // For subclasses and test doubles: a task that belongs to no session.
+  URLSessionTask();
+
+ private:
+  friend class URLSession;
+  friend struct URLSessionCore;
+
+  const std::uint64_t identifier_;
+  std::optional<URLRequest> original_;
+  std::atomic<State> state_{State::suspended};
+  std::shared_ptr<URLSessionCore> core_;  // set at creation; keeps the session's state alive
+  mutable std::mutex mutex_;
+  std::unique_ptr<Transfer> pending_;  // guarded by mutex_: the request until resume()
+  HTTPURLResponsePtr response_;        // guarded by mutex_
+  ErrorPtr error_;                     // guarded by mutex_
+};
+
+class URLSessionDataTask : public URLSessionTask {
+ public:
+  std::string className() const override { return "NSURLSessionDataTask"; }
+
+ protected:
+  URLSessionDataTask() = default;
+  friend class URLSession;
+};
+
+using URLSessionTaskPtr = std::shared_ptr<URLSessionTask>;
+using URLSessionDataTaskPtr = std::shared_ptr<URLSessionDataTask>;
+
+class URLSession : public Object {
+ public:
+  // Data: the body received (possibly empty); none when the task failed.
+  using DataTaskCompletionHandler =
+      std::function<void(std::optional<Data> data, HTTPURLResponsePtr response, ErrorPtr error)>;
+
+  // A process-wide session with the default configuration.
+  static std::shared_ptr<URLSession> sharedSession();
+  // `delegateQueue`: where completion handlers run; a new serial queue when
+  // null.
+  static std::shared_ptr<URLSession> sessionWithConfiguration(
+      URLSessionConfiguration configuration,
+      std::shared_ptr<OperationQueue> delegateQueue = nullptr);
+  ~URLSession() override;
+
+  // A suspended task; resume() sends the request.
+  URLSessionDataTaskPtr dataTaskWithRequest(const URLRequest& request,
+                                            DataTaskCompletionHandler completionHandler);
+  URLSessionDataTaskPtr dataTaskWithURL(URLPtr url, DataTaskCompletionHandler completionHandler);
+
+  const URLSessionConfiguration& configuration() const noexcept { return configuration_; }
+  const std::shared_ptr<OperationQueue>& delegateQueue() const noexcept { return delegateQueue_; }
+
+  // New tasks fail at once with URLErrorCancelled after either call.
+  void finishTasksAndInvalidate();
+  void invalidateAndCancel();
+
+  std::string className() const override { return "NSURLSession"; }
+
+ private:
+  URLSession(URLSessionConfiguration configuration, std::shared_ptr<OperationQueue> delegateQueue);
+
+  const URLSessionConfiguration configuration_;
+  const std::shared_ptr<OperationQueue> delegateQueue_;
+  std::shared_ptr<URLSessionCore> core_;
+};
+
+using URLSessionPtr = std::shared_ptr<URLSession>;
+
+}  // namespace kivi

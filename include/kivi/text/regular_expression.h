@@ -1,0 +1,109 @@
+// RegularExpression: an ICU regular expression matched against UTF-8 text.
+//
+// Patterns use ICU's syntax and matching rules. Matches are reported as byte
+// ranges into the UTF-8 text that was searched; the text is read in place,
+// never copied or converted, so searching a 100 MB text costs no extra memory.
+//
+//   kivi::ErrorPtr error;
+//   auto re = kivi::RegularExpression::create("b+", 0, &error);
+//   if (auto m = re->firstMatch("aébbb!")) {
+//     // m->location == 3, m->length == 3 ("é" takes two bytes)
+//   }
+//   re->numberOfMatches("b_bb_b");   // 3
+//
+// Malformed UTF-8 in the text or the pattern reads as U+FFFD; an embedded NUL
+// is an ordinary character. A pattern that does not compile gives nullptr and
+// an error; a search never fails loudly: a search that exhausts its step
+// budget or its backtracking memory (ICU's 8 MB default) finds nothing more,
+// and a text over 2 GiB (ICU's bound for UTF-8 input) finds nothing.
+//
+// Thread contract: a compiled expression is immutable and may be used from any
+// number of threads at once; each search makes its own matcher.
+#pragma once
+
+#include <cstddef>
+#include <cstdint>
+#include <functional>
+#include <limits>
+#include <memory>
+#include <optional>
+#include <string>
+#include <string_view>
+
+#include "kivi/base/error.h"
+
+namespace kivi {
+
+// A span of a UTF-8 text, in bytes.
+struct TextRange {
+  std::size_t location = 0;
+  std::size_t length = 0;
+
+  std::size_t end() const noexcept { return location + length; }
+  friend bool operator==(const TextRange&, const TextRange&) = default;
+};
+
+// The whole of any text: ranges are clamped to the text they are used with.
+inline constexpr TextRange kWholeText{0, std::numeric_limits<std::size_t>::max()};
+
+using RegularExpressionOptions = std::uint32_t;
+inline constexpr RegularExpressionOptions RegularExpressionCaseInsensitive = 1 << 0;
+inline constexpr RegularExpressionOptions RegularExpressionAllowCommentsAndWhitespace = 1 << 1;
+inline constexpr RegularExpressionOptions RegularExpressionIgnoreMetacharacters = 1 << 2;
+inline constexpr RegularExpressionOptions RegularExpressionDotMatchesLineSeparators = 1 << 3;
+inline constexpr RegularExpressionOptions RegularExpressionAnchorsMatchLines = 1 << 4;
+inline constexpr RegularExpressionOptions RegularExpressionUseUnixLineSeparators = 1 << 5;
+inline constexpr RegularExpressionOptions RegularExpressionUseUnicodeWordBoundaries = 1 << 6;
+
+// The error code of a pattern that does not compile (in kivi::CocoaErrorDomain,
+// "NSCocoaErrorDomain"); the user info's "NSInvalidValue" holds the pattern.
+inline constexpr std::int64_t RegularExpressionInvalidPatternError = 2048;
+
+class RegularExpression {
+ public:
+  // Step budget of a search: 0 is unlimited. A step is ICU's unit of match
+  // work, roughly ten thousand engine operations (about a millisecond); the
+  // count is deterministic, not a clock. A search that runs out reports no
+  // (further) match.
+  using StepLimit = std::int32_t;
+
+  // Nullptr, and *error (when given) set, if `pattern` does not compile.
+  // *error is set to nullptr on success.
+  static std::shared_ptr<const RegularExpression> create(std::string_view pattern,
+                                                         RegularExpressionOptions options = 0,
+                                                         ErrorPtr* error = nullptr);
+  ~RegularExpression();
+  RegularExpression(const RegularExpression&) = delete;
+  RegularExpression& operator=(const RegularExpression&) = delete;
+
+  const std::string& pattern() const noexcept { return pattern_; }
+  RegularExpressionOptions options() const noexcept { return options_; }
+
+  // The leftmost match inside `range` of `text`. The range acts as the whole
+  // text: "^", "$" and look-around stop at its ends. A range boundary inside
+  // a multi-byte character cuts that character, which then reads as U+FFFD.
+  std::optional<TextRange> firstMatch(std::string_view text, TextRange range = kWholeText,
+                                      StepLimit stepLimit = 0) const;
+
+  // Calls `visit` with each non-overlapping match in order until it returns
+  // false; returns the number of matches visited.
+  std::size_t enumerateMatches(std::string_view text, TextRange range,
+                               const std::function<bool(TextRange)>& visit,
+                               StepLimit stepLimit = 0) const;
+
+  std::size_t numberOfMatches(std::string_view text, TextRange range = kWholeText,
+                              StepLimit stepLimit = 0) const;
+
+ private:
+  struct Compiled;
+  RegularExpression(std::string pattern, RegularExpressionOptions options,
+                    std::unique_ptr<Compiled> compiled);
+
+  const std::string pattern_;
+  const RegularExpressionOptions options_;
+  const std::unique_ptr<Compiled> compiled_;
+};
+
+using RegularExpressionPtr = std::shared_ptr<const RegularExpression>;
+
+}  // namespace kivi
