@@ -3,9 +3,11 @@
 #include <algorithm>
 
 #include "kivi/dispatch/worker_pool.h"
-#include "queue_core.h"
+#include "operation_internals.h"
 
 namespace kivi {
+
+Operation::Operation() : state_(std::make_unique<detail::OperationState>()) {}
 
 Operation::~Operation() = default;
 
@@ -13,19 +15,22 @@ void Operation::start() {
   if (isAsynchronous()) return;
   if (isFinished() || isExecuting()) return;
   const bool cancelled = isCancelled();
-  if (!cancelled && !isReady()) return;
-  if (baseStarted_.exchange(true)) return;
+  if (!cancelled && !isReady()) {
+    state_->refusedNotReady.store(true, std::memory_order_release);
+    return;
+  }
+  if (state_->baseStarted.exchange(true)) return;
   auto self = weak_from_this().lock();
   if (!cancelled) {
     willChangeValueForKey("isExecuting");
-    baseExecuting_ = true;
+    state_->baseExecuting = true;
     didChangeValueForKey("isExecuting");
     main();
   }
   willChangeValueForKey("isExecuting");
   willChangeValueForKey("isFinished");
-  baseExecuting_ = false;
-  baseFinished_ = true;
+  state_->baseExecuting = false;
+  state_->baseFinished = true;
   didChangeValueForKey("isFinished");
   didChangeValueForKey("isExecuting");
 }
@@ -33,10 +38,10 @@ void Operation::start() {
 void Operation::main() {}
 
 void Operation::cancel() {
-  if (cancelAnnounced_.exchange(true)) return;
+  if (state_->cancelAnnounced.exchange(true)) return;
   auto self = weak_from_this().lock();
   willChangeValueForKey("isCancelled");
-  cancelled_ = true;
+  state_->cancelled = true;
   didChangeValueForKey("isCancelled");
   if (!isFinished()) {
     willChangeValueForKey("isReady");
@@ -44,19 +49,19 @@ void Operation::cancel() {
   }
 }
 
-bool Operation::isCancelled() const { return cancelled_; }
-bool Operation::isExecuting() const { return baseExecuting_; }
-bool Operation::isFinished() const { return baseFinished_; }
+bool Operation::isCancelled() const { return state_->cancelled; }
+bool Operation::isExecuting() const { return state_->baseExecuting; }
+bool Operation::isFinished() const { return state_->baseFinished; }
 bool Operation::isAsynchronous() const { return false; }
 
 bool Operation::isReady() const {
   if (isCancelled()) return true;
-  if (dependencyCount_.load(std::memory_order_acquire) == 0) return true;
+  if (state_->dependencyCount.load(std::memory_order_acquire) == 0) return true;
   std::vector<OperationPtr> dependencies;
   {
-    std::lock_guard lock(mutex_);
-    if (dependencies_.empty()) return true;
-    dependencies = dependencies_;
+    std::lock_guard lock(state_->mutex);
+    if (state_->dependencies.empty()) return true;
+    dependencies = state_->dependencies;
   }
   return std::all_of(dependencies.begin(), dependencies.end(),
                      [](const OperationPtr& d) { return d->isFinished(); });
@@ -65,21 +70,22 @@ bool Operation::isReady() const {
 void Operation::addDependency(const OperationPtr& operation) {
   if (!operation || operation.get() == this) return;
   {
-    std::lock_guard lock(mutex_);
-    if (std::find(dependencies_.begin(), dependencies_.end(), operation) != dependencies_.end()) {
+    std::lock_guard lock(state_->mutex);
+    if (std::find(state_->dependencies.begin(), state_->dependencies.end(), operation) !=
+        state_->dependencies.end()) {
       return;
     }
   }
   auto self = weak_from_this().lock();
   willChangeValueForKey("isReady");
   {
-    std::lock_guard lock(mutex_);
-    dependencies_.push_back(operation);
-    dependencyCount_.store(dependencies_.size(), std::memory_order_release);
+    std::lock_guard lock(state_->mutex);
+    state_->dependencies.push_back(operation);
+    state_->dependencyCount.store(state_->dependencies.size(), std::memory_order_release);
   }
   if (self) {
-    std::lock_guard lock(operation->mutex_);
-    operation->dependents_.push_back(std::static_pointer_cast<Operation>(self));
+    std::lock_guard lock(operation->state_->mutex);
+    operation->state_->dependents.push_back(std::static_pointer_cast<Operation>(self));
   }
   didChangeValueForKey("isReady");
 }
@@ -89,13 +95,13 @@ void Operation::removeDependency(const OperationPtr& operation) {
   auto self = weak_from_this().lock();
   willChangeValueForKey("isReady");
   {
-    std::lock_guard lock(mutex_);
-    std::erase(dependencies_, operation);
-    dependencyCount_.store(dependencies_.size(), std::memory_order_release);
+    std::lock_guard lock(state_->mutex);
+    std::erase(state_->dependencies, operation);
+    state_->dependencyCount.store(state_->dependencies.size(), std::memory_order_release);
   }
   {
-    std::lock_guard lock(operation->mutex_);
-    std::erase_if(operation->dependents_, [this](const std::weak_ptr<Operation>& w) {
+    std::lock_guard lock(operation->state_->mutex);
+    std::erase_if(operation->state_->dependents, [this](const std::weak_ptr<Operation>& w) {
       auto op = w.lock();
       return !op || op.get() == this;
     });
@@ -104,37 +110,39 @@ void Operation::removeDependency(const OperationPtr& operation) {
 }
 
 std::vector<OperationPtr> Operation::dependencies() const {
-  std::lock_guard lock(mutex_);
-  return dependencies_;
+  std::lock_guard lock(state_->mutex);
+  return state_->dependencies;
 }
 
 std::function<void()> Operation::completionBlock() const {
-  std::lock_guard lock(mutex_);
-  return completionBlock_;
+  std::lock_guard lock(state_->mutex);
+  return state_->completionBlock;
 }
 
 void Operation::setCompletionBlock(std::function<void()> block) {
-  std::lock_guard lock(mutex_);
-  completionBlock_ = std::move(block);
+  std::lock_guard lock(state_->mutex);
+  state_->completionBlock = std::move(block);
 }
 
 std::string Operation::name() const {
-  std::lock_guard lock(mutex_);
-  return name_;
+  std::lock_guard lock(state_->mutex);
+  return state_->name;
 }
 
 void Operation::setName(std::string name) {
   willChangeValueForKey("name");
   {
-    std::lock_guard lock(mutex_);
-    name_ = std::move(name);
+    std::lock_guard lock(state_->mutex);
+    state_->name = std::move(name);
   }
   didChangeValueForKey("name");
 }
 
 void Operation::waitUntilFinished() {
+  if (state_->finishDelivered.load(std::memory_order_acquire)) return;
   // A futex of this operation's own: finishing wakes only its waiters.
-  finishDelivered_.wait(false, std::memory_order_acquire);
+  WorkerPool::BlockingScope blocking;
+  state_->finishDelivered.wait(false, std::memory_order_acquire);
 }
 
 Value Operation::valueForKey(std::string_view key) const {
@@ -148,36 +156,38 @@ Value Operation::valueForKey(std::string_view key) const {
   return Object::valueForKey(key);
 }
 
-std::shared_ptr<detail::QueueCore> Operation::queueCore() const {
-  std::lock_guard lock(mutex_);
-  return queue_.lock();
+namespace {
+std::shared_ptr<detail::QueueCore> queueOf(const detail::OperationState& state) {
+  std::lock_guard lock(state.mutex);
+  return state.queue.lock();
 }
+}  // namespace
 
 void Operation::keyValueDidChange(std::string_view key) {
   if (key == "isFinished") {
     if (isFinished()) didFinish();
   } else if (key == "isReady") {
-    if (queueStarted_.load(std::memory_order_acquire)) return;
-    if (auto core = queueCore()) {
+    if (state_->queueStarted.load(std::memory_order_acquire)) return;
+    if (auto core = queueOf(*state_)) {
       core->readinessChanged(*this);
     } else {
-      readyEpoch_.fetch_add(1);  // seen by a queue that is adding us right now
+      state_->readyEpoch.fetch_add(1);  // seen by a queue that is adding us right now
     }
   }
 }
 
 void Operation::didFinish() {
-  if (finishHandled_.exchange(true)) return;
+  if (state_->finishHandled.exchange(true)) return;
   auto self = weak_from_this().lock();
   std::vector<std::weak_ptr<Operation>> dependents;
   std::function<void()> completion;
   std::shared_ptr<detail::QueueCore> core;
   {
-    std::lock_guard lock(mutex_);
-    dependents.swap(dependents_);
-    completion = std::move(completionBlock_);
-    completionBlock_ = nullptr;
-    core = queue_.lock();
+    std::lock_guard lock(state_->mutex);
+    dependents.swap(state_->dependents);
+    completion = std::move(state_->completionBlock);
+    state_->completionBlock = nullptr;
+    core = state_->queue.lock();
   }
   for (const auto& weakDependent : dependents) {
     if (auto dependent = weakDependent.lock()) {
@@ -190,8 +200,8 @@ void Operation::didFinish() {
 }
 
 void Operation::deliverFinish() {
-  finishDelivered_.store(true, std::memory_order_release);
-  finishDelivered_.notify_all();
+  state_->finishDelivered.store(true, std::memory_order_release);
+  state_->finishDelivered.notify_all();
 }
 
 void BlockOperation::main() {

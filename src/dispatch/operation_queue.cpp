@@ -4,7 +4,7 @@
 #include <utility>
 
 #include "kivi/dispatch/worker_pool.h"
-#include "queue_core.h"
+#include "operation_internals.h"
 
 namespace kivi {
 
@@ -19,54 +19,85 @@ thread_local const Operation* tDrainOperation = nullptr;
 thread_local bool tDrainOperationFinished = false;
 }  // namespace
 
+void EntryList::insertBefore(QueueEntry* position, QueueEntry* entry) {
+  QueueEntry* previous = position ? position->previous : tail_;
+  entry->previous = previous;
+  entry->next = position;
+  (previous ? previous->next : head_) = entry;
+  (position ? position->previous : tail_) = entry;
+  ++size_;
+}
+
+void EntryList::remove(QueueEntry* entry) {
+  (entry->previous ? entry->previous->next : head_) = entry->next;
+  (entry->next ? entry->next->previous : tail_) = entry->previous;
+  entry->previous = entry->next = nullptr;
+  --size_;
+}
+
+QueueCore::~QueueCore() {
+  // Only reached with both lists empty (keepAlive holds the core while it has
+  // operations), but entries must never outlive it.
+  for (EntryList* list : {&pending, &running}) {
+    while (QueueEntry* entry = list->front()) {
+      list->remove(entry);
+      stateOf(*entry->operation).entry = nullptr;
+      delete entry;
+    }
+  }
+}
+
 std::int64_t QueueCore::limitLocked() const {
   return maxCount < 0 ? OperationQueue::kDefaultConcurrency : maxCount;
 }
 
 bool QueueCore::add(const OperationPtr& operation) {
   if (!operation || operation->isFinished()) return false;
-  if (operation->enqueued_.exchange(true)) return false;
-  const std::uint64_t epoch = ++operation->readyEpoch_;
+  OperationState& state = stateOf(*operation);
+  if (state.enqueued.exchange(true)) return false;
+  // The queue is known to the operation before the operation is listed, so
+  // that a finish is never delivered to waiters before the queue lets go.
+  {
+    std::lock_guard lock(state.mutex);
+    state.queue = weak_from_this();
+  }
+  const std::uint64_t epoch = ++state.readyEpoch;
   const bool ready = operation->isReady();
   std::size_t drainers = 0;
   {
     std::lock_guard lock(mutex);
-    auto& slot = operation->slot_;
-    slot.listed = true;
-    slot.sequence = nextSequence++;
-    slot.held = operation;
-    pending.pushBack(operation.get());
-    slot.ready = ready;
-    slot.readyEpoch = epoch;
+    // Finished meanwhile (started by hand): its finish found no entry and
+    // was delivered; there is nothing to list.
+    if (state.finishHandled.load(std::memory_order_acquire)) return true;
+    auto* entry = new QueueEntry;
+    entry->operation = operation;
+    entry->sequence = nextSequence++;
+    entry->ready = ready;
+    entry->readyEpoch = epoch;
+    state.entry = entry;
+    pending.pushBack(entry);
     if (ready) ++readyPending;
     if (!keepAlive) keepAlive = shared_from_this();
     drainers = drainersNeededLocked();
   }
-  {
-    std::lock_guard lock(operation->mutex_);
-    operation->queue_ = weak_from_this();
-  }
   launchDrainers(drainers);
-  // Announcements made before the operation knew its queue did not reach us.
-  if (operation->finishHandled_) {
-    operationFinished(*operation);
-  } else if (operation->readyEpoch_.load() != epoch) {
-    readinessChanged(*operation);
-  }
+  // Announcements made before the operation was listed did not reach us.
+  if (state.readyEpoch.load() != epoch) readinessChanged(*operation);
   return true;
 }
 
 void QueueCore::readinessChanged(Operation& operation) {
-  const std::uint64_t epoch = ++operation.readyEpoch_;
+  OperationState& state = stateOf(operation);
+  const std::uint64_t epoch = ++state.readyEpoch;
   const bool ready = operation.isReady();
   std::size_t drainers = 0;
   {
     std::lock_guard lock(mutex);
-    auto& slot = operation.slot_;
-    if (!slot.listed || slot.started || epoch <= slot.readyEpoch) return;
-    slot.readyEpoch = epoch;
-    if (slot.ready == ready) return;
-    slot.ready = ready;
+    QueueEntry* entry = state.entry;
+    if (!entry || entry->started || epoch <= entry->readyEpoch) return;
+    entry->readyEpoch = epoch;
+    if (entry->ready == ready) return;
+    entry->ready = ready;
     ready ? ++readyPending : --readyPending;
     drainers = drainersNeededLocked();
   }
@@ -97,21 +128,32 @@ void QueueCore::settle(Retired& retired) {
 }
 
 std::size_t QueueCore::retireLocked(Operation& operation, Retired& retired) {
-  auto& slot = operation.slot_;
-  if (!slot.listed || slot.done) return 0;
-  slot.done = true;
-  slot.listed = false;
-  retired.held = std::move(slot.held);
-  if (slot.started) {
-    running.remove(&operation);
+  OperationState& state = stateOf(operation);
+  QueueEntry* entry = state.entry;
+  if (!entry) return 0;
+  state.entry = nullptr;
+  if (entry->started) {
+    running.remove(entry);
   } else {
-    pending.remove(&operation);
-    if (slot.ready) --readyPending;
+    pending.remove(entry);
+    if (entry->ready) --readyPending;
   }
+  retired.held = std::move(entry->operation);
+  delete entry;
   const bool empty = pending.empty() && running.empty();
   if (empty) retired.keeper = std::move(keepAlive);
   if (batchWaiters || (emptyWaiters && empty)) left.notify_all();
   return drainersNeededLocked();
+}
+
+void QueueCore::requeueLocked(QueueEntry* entry) {
+  running.remove(entry);
+  entry->started = false;
+  entry->ready = false;
+  QueueEntry* position = pending.front();
+  while (position && position->sequence < entry->sequence) position = position->next;
+  pending.insertBefore(position, entry);
+  stateOf(*entry->operation).queueStarted.store(false, std::memory_order_release);
 }
 
 std::size_t QueueCore::drainersNeededLocked() {
@@ -137,23 +179,24 @@ void QueueCore::drain() {
   std::size_t drainers = 0;  // likewise, drain jobs to launch
   std::unique_lock lock(mutex);
   for (;;) {
-    OperationPtr operation;
+    QueueEntry* entry = nullptr;
     if (!suspended && running.size() < static_cast<std::size_t>(limitLocked())) {
-      for (Operation* op = pending.front(); op; op = SlotList::next(op)) {
-        if (op->slot_.ready) {
-          operation = op->slot_.held;
+      for (QueueEntry* e = pending.front(); e; e = e->next) {
+        if (e->ready) {
+          entry = e;
           break;
         }
       }
     }
     --searching;
-    if (!operation) break;
+    if (!entry) break;
     --readyPending;
-    auto& slot = operation->slot_;
-    pending.remove(operation.get());
-    running.pushBack(operation.get());
-    slot.started = true;
-    operation->queueStarted_.store(true, std::memory_order_release);
+    pending.remove(entry);
+    running.pushBack(entry);
+    entry->started = true;
+    OperationPtr operation = entry->operation;
+    OperationState& state = stateOf(*operation);
+    state.queueStarted.store(true, std::memory_order_release);
     lock.unlock();
     settle(retired);
     launchDrainers(std::exchange(drainers, 0));
@@ -161,11 +204,23 @@ void QueueCore::drain() {
     tDrainOperationFinished = false;
     operation->start();
     tDrainOperation = nullptr;
+    // A synchronous operation whose start() found it not ready after all (a
+    // dependency was added after the queue picked it) goes back to wait.
+    const bool refused = !tDrainOperationFinished &&
+                         state.refusedNotReady.exchange(false, std::memory_order_acq_rel);
     lock.lock();
     ++searching;
-    if (tDrainOperationFinished) drainers = retireLocked(*operation, retired);
-    retired.deliverFinish = tDrainOperationFinished;
-    retired.operation = std::move(operation);
+    if (tDrainOperationFinished) {
+      drainers = retireLocked(*operation, retired);
+      retired.deliverFinish = true;
+      retired.operation = std::move(operation);
+    } else if (refused && state.entry == entry && entry->started) {
+      requeueLocked(entry);
+      lock.unlock();
+      readinessChanged(*operation);
+      operation = nullptr;
+      lock.lock();
+    }
   }
   lock.unlock();
   tDrainCore = nullptr;
@@ -174,20 +229,22 @@ void QueueCore::drain() {
 }
 
 std::vector<OperationPtr> QueueCore::operationsLocked() const {
-  std::vector<OperationPtr> all;
-  all.reserve(pending.size() + running.size());
-  for (const SlotList* list : {&running, &pending}) {
-    for (Operation* op = list->front(); op; op = SlotList::next(op)) all.push_back(op->slot_.held);
+  std::vector<const QueueEntry*> entries;
+  entries.reserve(pending.size() + running.size());
+  for (const EntryList* list : {&running, &pending}) {
+    for (const QueueEntry* e = list->front(); e; e = e->next) entries.push_back(e);
   }
-  std::sort(all.begin(), all.end(), [](const OperationPtr& a, const OperationPtr& b) {
-    return a->slot_.sequence < b->slot_.sequence;
-  });
+  std::sort(entries.begin(), entries.end(),
+            [](const QueueEntry* a, const QueueEntry* b) { return a->sequence < b->sequence; });
+  std::vector<OperationPtr> all;
+  all.reserve(entries.size());
+  for (const QueueEntry* e : entries) all.push_back(e->operation);
   return all;
 }
 
 bool QueueCore::allDoneLocked(const std::vector<OperationPtr>& operations) {
   return std::all_of(operations.begin(), operations.end(),
-                     [](const OperationPtr& op) { return op->slot_.done; });
+                     [](const OperationPtr& op) { return stateOf(*op).entry == nullptr; });
 }
 
 }  // namespace detail
@@ -205,6 +262,7 @@ void OperationQueue::addOperations(const std::vector<OperationPtr>& operations,
     if (core_->add(operation)) added.push_back(operation);
   }
   if (!waitUntilFinished || added.empty()) return;
+  WorkerPool::BlockingScope blocking;
   std::unique_lock lock(core_->mutex);
   ++core_->batchWaiters;
   core_->left.wait(lock, [&] { return detail::QueueCore::allDoneLocked(added); });
@@ -220,6 +278,7 @@ void OperationQueue::cancelAllOperations() {
 }
 
 void OperationQueue::waitUntilAllOperationsAreFinished() {
+  WorkerPool::BlockingScope blocking;
   std::unique_lock lock(core_->mutex);
   ++core_->emptyWaiters;
   core_->left.wait(lock, [&] { return core_->pending.empty() && core_->running.empty(); });

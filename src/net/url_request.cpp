@@ -63,8 +63,7 @@ void MutableURLRequest::addValue(std::string_view value, std::string_view field)
 
 void MutableURLRequest::setAllHTTPHeaderFields(const std::optional<StringDictionary>& fields) {
   fields_.clear();
-  if (!fields) return;
-  for (const auto& [name, value] : *fields) setValue(value, name);
+  if (fields) fields_.assign(fields->begin(), fields->end());
 }
 
 }  // namespace kivi

@@ -2,17 +2,16 @@
 
 #include <curl/curl.h>
 #include <sys/epoll.h>
-#include <sys/eventfd.h>
-#include <sys/timerfd.h>
-#include <unistd.h>
 
 #include <algorithm>
-#include <cerrno>
 #include <chrono>
-#include <thread>
+#include <cstdint>
+#include <mutex>
 #include <unordered_map>
 #include <vector>
 
+#include "kivi/dispatch/detail/event_loop.h"
+#include "kivi/dispatch/dispatch_clock.h"
 #include "kivi/text/unicode_text.h"
 
 namespace kivi {
@@ -20,6 +19,12 @@ namespace kivi {
 namespace {
 
 using Clock = std::chrono::steady_clock;
+
+// How long a connection is kept without being used.
+constexpr auto kIdleConnectionLifetime = std::chrono::seconds(90);
+// How many connections a session keeps open at most, over all hosts, as a
+// multiple of the per-host limit.
+constexpr long kHostsKeptPerSession = 16;
 
 std::atomic<std::uint64_t> gNextTaskIdentifier{1};
 
@@ -180,6 +185,8 @@ struct Transfer {
   std::size_t headerBytes = 0;
   std::size_t headerLimit = 0;
   bool headersTooLarge = false;
+  std::size_t bodyLimit = 0;
+  bool bodyTooLarge = false;
   Clock::time_point lastActivity;
   Clock::duration idleTimeout{};
   curl_off_t lastUp = 0, lastDown = 0;
@@ -199,14 +206,25 @@ struct Ended {
   std::int64_t code = 0;
 };
 
+struct URLSessionTask::Impl {
+  std::mutex mutex;
+  // The session's state, until the task has completed. Guarded by mutex.
+  std::shared_ptr<URLSessionCore> core;
+  std::unique_ptr<Transfer> pending;  // guarded by mutex: the request until resume()
+  HTTPURLResponsePtr response;        // guarded by mutex
+  ErrorPtr error;                     // guarded by mutex
+};
+
 // The multi handle is driven by whichever thread has something to do: resume()
 // adds the transfer and sends the request on the calling thread, cancel()
-// takes it out on its thread, and the session's network thread sleeps in
-// epoll_wait until a socket is ready or a deadline passes (a timerfd). No
-// thread ever has to wake another to get a request sent.
+// takes it out on its thread, and the library's event thread runs it when a
+// socket is ready or a deadline passes. No thread has to wake another to get a
+// request sent.
 struct URLSessionCore : std::enable_shared_from_this<URLSessionCore> {
   URLSessionCore(URLSessionConfiguration configuration, std::shared_ptr<OperationQueue> queue);
   ~URLSessionCore();
+  // Makes the timers, which hold the core weakly.
+  void makeTimers();
 
   const URLSessionConfiguration configuration;
   const std::shared_ptr<OperationQueue> delegateQueue;
@@ -214,31 +232,35 @@ struct URLSessionCore : std::enable_shared_from_this<URLSessionCore> {
   // Guards everything below. Every call into `multi` is made holding it, so
   // libcurl's callbacks run under it too.
   std::mutex mutex;
+  // Made with the first transfer; dropped, with the connections it keeps,
+  // once the session has been unused for a while or is invalidated.
   CURLM* multi = nullptr;
-  int epollFd = -1;  // the transfers' sockets, timerFd and wakeFd
-  int timerFd = -1;  // fires at `armed`
-  int wakeFd = -1;   // an eventfd: the network thread should see whether to stop
   std::unordered_map<std::uint64_t, std::unique_ptr<Transfer>> active;  // by task identifier
   std::vector<Ended> ended;  // completed once the lock is released
   bool invalidated = false;
-  bool threadRunning = false;
   bool timeoutNow = false;  // libcurl asked to be driven again at once
   Clock::time_point curlDeadline = Clock::time_point::max();
   Clock::time_point idleCheck = Clock::time_point::max();  // no transfer goes idle before
-  Clock::time_point armed = Clock::time_point::max();
+  Clock::time_point connectionsExpire = Clock::time_point::max();
+  std::unique_ptr<DispatchTimer> curlTimer;     // fires at curlDeadline
+  std::unique_ptr<DispatchTimer> sessionTimer;  // fires at idleCheck or connectionsExpire
+  Clock::time_point curlArmed = Clock::time_point::max();
+  Clock::time_point sessionArmed = Clock::time_point::max();
 
   void submit(std::unique_ptr<Transfer> transfer);
   void requestCancel(std::uint64_t taskIdentifier);
   void invalidate(bool cancelRunning);
-  void run();
   bool configure(Transfer& transfer);
   void complete(std::unique_ptr<Transfer> transfer, std::optional<Data> data,
                 HTTPURLResponsePtr response, ErrorPtr error);
   void finish(Ended ended);
+  void socketReady(curl_socket_t socket, std::uint32_t events);
 
   // Runs `work` under the lock, then completes what it ended.
   template <class Work>
   void withLock(Work&& work);
+  bool makeMultiLocked();
+  void releaseMultiLocked();
   void driveLocked(curl_socket_t socket, int events);
   void endLocked(std::uint64_t taskIdentifier, CURLcode result, std::int64_t code);
   void expireIdleLocked(Clock::time_point now);
@@ -276,6 +298,10 @@ std::size_t onBody(char* buffer, std::size_t size, std::size_t count, void* user
   auto& t = *static_cast<Transfer*>(user);
   const std::size_t length = size * count;
   t.lastActivity = Clock::now();
+  if (length > t.bodyLimit - t.received.size()) {
+    t.bodyTooLarge = true;
+    return 0;  // aborts the transfer
+  }
   t.received.insert(t.received.end(), reinterpret_cast<std::uint8_t*>(buffer),
                     reinterpret_cast<std::uint8_t*>(buffer) + length);
   return length;
@@ -291,29 +317,34 @@ int onProgress(void* user, curl_off_t, curl_off_t downloaded, curl_off_t, curl_o
   return 0;
 }
 
-// libcurl tells which sockets to watch; `registered` (libcurl's per-socket
-// pointer) is non-null once the socket is in the epoll set.
-int onSocket(CURL*, curl_socket_t socket, int what, void* user, void* registered) {
+std::uint32_t epollEvents(int what) {
+  return ((what & CURL_POLL_IN) ? EPOLLIN : 0u) | ((what & CURL_POLL_OUT) ? EPOLLOUT : 0u);
+}
+
+// libcurl tells which sockets to watch; its per-socket pointer holds the
+// event thread's identifier of the watch.
+int onSocket(CURL*, curl_socket_t socket, int what, void* user, void* assigned) {
   auto& core = *static_cast<URLSessionCore*>(user);
+  auto& loop = detail::EventLoop::shared();
+  const auto watch = reinterpret_cast<std::uintptr_t>(assigned);
   if (what == CURL_POLL_REMOVE) {
-    if (registered) {
-      ::epoll_ctl(core.epollFd, EPOLL_CTL_DEL, socket, nullptr);
+    if (watch) {
+      loop.unwatch(watch);
       curl_multi_assign(core.multi, socket, nullptr);
     }
     return 0;
   }
-  epoll_event event{};
-  event.events = ((what & CURL_POLL_IN) ? EPOLLIN : 0u) | ((what & CURL_POLL_OUT) ? EPOLLOUT : 0u);
-  event.data.fd = socket;
-  if (registered) {
-    ::epoll_ctl(core.epollFd, EPOLL_CTL_MOD, socket, &event);
-  } else {
-    // A number reused after a close that epoll has not seen yet is there already.
-    if (::epoll_ctl(core.epollFd, EPOLL_CTL_ADD, socket, &event) != 0 && errno == EEXIST) {
-      ::epoll_ctl(core.epollFd, EPOLL_CTL_MOD, socket, &event);
-    }
-    curl_multi_assign(core.multi, socket, &core);
+  if (watch) {
+    loop.modify(watch, epollEvents(what));
+    return 0;
   }
+  const auto added = loop.watch(socket, epollEvents(what),
+                                [weak = core.weak_from_this(), socket](std::uint32_t events) {
+                                  if (auto c = weak.lock()) c->socketReady(socket, events);
+                                });
+  if (!added) return -1;  // no event thread: libcurl ends the transfer with an error
+  curl_multi_assign(core.multi, socket,
+                    reinterpret_cast<void*>(static_cast<std::uintptr_t>(added)));
   return 0;
 }
 
@@ -339,30 +370,59 @@ URLSessionCore::URLSessionCore(URLSessionConfiguration configuration,
                                std::shared_ptr<OperationQueue> queue)
     : configuration(std::move(configuration)), delegateQueue(std::move(queue)) {
   initializeCurlOnce();
-  epollFd = ::epoll_create1(EPOLL_CLOEXEC);
-  timerFd = ::timerfd_create(CLOCK_MONOTONIC, TFD_NONBLOCK | TFD_CLOEXEC);
-  wakeFd = ::eventfd(0, EFD_NONBLOCK | EFD_CLOEXEC);
-  for (int fd : {timerFd, wakeFd}) {
-    epoll_event event{};
-    event.events = EPOLLIN;
-    event.data.fd = fd;
-    ::epoll_ctl(epollFd, EPOLL_CTL_ADD, fd, &event);
-  }
-  multi = curl_multi_init();
-  curl_multi_setopt(multi, CURLMOPT_PIPELINING, CURLPIPE_MULTIPLEX);
-  curl_multi_setopt(multi, CURLMOPT_MAX_HOST_CONNECTIONS,
-                    static_cast<long>(std::max<std::int64_t>(
-                        0, this->configuration.HTTPMaximumConnectionsPerHost)));
-  curl_multi_setopt(multi, CURLMOPT_SOCKETFUNCTION, onSocket);
-  curl_multi_setopt(multi, CURLMOPT_SOCKETDATA, this);
-  curl_multi_setopt(multi, CURLMOPT_TIMERFUNCTION, onTimer);
-  curl_multi_setopt(multi, CURLMOPT_TIMERDATA, this);
+}
+
+void URLSessionCore::makeTimers() {
+  const auto& clock = DispatchClock::system();
+  curlTimer = clock->makeTimer([weak = weak_from_this()] {
+    if (auto core = weak.lock()) {
+      core->withLock([&] {
+        if (core->multi && Clock::now() >= core->curlDeadline) {
+          core->driveLocked(CURL_SOCKET_TIMEOUT, 0);
+        }
+      });
+    }
+  });
+  sessionTimer = clock->makeTimer([weak = weak_from_this()] {
+    if (auto core = weak.lock()) {
+      core->withLock([&] {
+        const auto now = Clock::now();
+        if (now >= core->idleCheck) core->expireIdleLocked(now);
+        if (core->active.empty() && now >= core->connectionsExpire) core->releaseMultiLocked();
+      });
+    }
+  });
 }
 
 URLSessionCore::~URLSessionCore() {
   // Transfers hold the core through their task, so none is left by now.
-  curl_multi_cleanup(multi);  // closes the cached connections
-  for (int fd : {epollFd, timerFd, wakeFd}) ::close(fd);
+  std::lock_guard lock(mutex);
+  releaseMultiLocked();
+}
+
+bool URLSessionCore::makeMultiLocked() {
+  multi = curl_multi_init();
+  if (!multi) return false;
+  const long perHost =
+      static_cast<long>(std::max<std::int64_t>(0, configuration.HTTPMaximumConnectionsPerHost));
+  curl_multi_setopt(multi, CURLMOPT_PIPELINING, CURLPIPE_MULTIPLEX);
+  curl_multi_setopt(multi, CURLMOPT_MAX_HOST_CONNECTIONS, perHost);
+  // libcurl's default keeps only four connections per running transfer, so
+  // connections would be closed whenever fewer transfers run than are open.
+  curl_multi_setopt(multi, CURLMOPT_MAXCONNECTS, std::max(perHost, 1L) * kHostsKeptPerSession);
+  curl_multi_setopt(multi, CURLMOPT_SOCKETFUNCTION, onSocket);
+  curl_multi_setopt(multi, CURLMOPT_SOCKETDATA, this);
+  curl_multi_setopt(multi, CURLMOPT_TIMERFUNCTION, onTimer);
+  curl_multi_setopt(multi, CURLMOPT_TIMERDATA, this);
+  return true;
+}
+
+void URLSessionCore::releaseMultiLocked() {
+  if (!multi || !active.empty()) return;
+  curl_multi_cleanup(multi);  // closes the kept connections
+  multi = nullptr;
+  timeoutNow = false;
+  curlDeadline = connectionsExpire = Clock::time_point::max();
 }
 
 bool URLSessionCore::configure(Transfer& t) {
@@ -380,6 +440,11 @@ bool URLSessionCore::configure(Transfer& t) {
   curl_easy_setopt(easy, CURLOPT_PROTOCOLS_STR, "http,https");
   curl_easy_setopt(easy, CURLOPT_REDIR_PROTOCOLS_STR, "http,https");
   curl_easy_setopt(easy, CURLOPT_HTTP_VERSION, CURL_HTTP_VERSION_2TLS);
+  // Wait for a connection that is being set up, in case it turns out to
+  // multiplex, rather than open another one to the same host.
+  curl_easy_setopt(easy, CURLOPT_PIPEWAIT, 1L);
+  curl_easy_setopt(easy, CURLOPT_MAXAGE_CONN,
+                   static_cast<long>(std::chrono::seconds(kIdleConnectionLifetime).count()));
   curl_easy_setopt(easy, CURLOPT_ACCEPT_ENCODING, "");
   curl_easy_setopt(easy, CURLOPT_HEADERFUNCTION, onHeader);
   curl_easy_setopt(easy, CURLOPT_HEADERDATA, &t);
@@ -400,6 +465,10 @@ bool URLSessionCore::configure(Transfer& t) {
         static_cast<long>(std::min(2e9, configuration.timeoutIntervalForResource * 1000)));
   }
   t.headerLimit = configuration.maximumResponseHeaderBytes;
+  t.bodyLimit = configuration.maximumResponseBodyBytes;
+  // A declared length over the limit ends the transfer before the body comes.
+  curl_easy_setopt(easy, CURLOPT_MAXFILESIZE_LARGE,
+                   static_cast<curl_off_t>(std::min<std::size_t>(t.bodyLimit, INT64_MAX)));
 
   // Method and body.
   const std::string& method = request.HTTPMethod();
@@ -444,13 +513,16 @@ void URLSessionCore::withLock(Work&& work) {
     std::lock_guard lock(mutex);
     work();
     // Taking a transfer out may let a queued one start.
-    if (timeoutNow) driveLocked(CURL_SOCKET_TIMEOUT, 0);
+    if (timeoutNow && multi) driveLocked(CURL_SOCKET_TIMEOUT, 0);
+    if (active.empty() && multi) {
+      if (invalidated) {
+        releaseMultiLocked();
+      } else if (connectionsExpire == Clock::time_point::max()) {
+        connectionsExpire = Clock::now() + kIdleConnectionLifetime;
+      }
+    }
     rearmLocked();
     done.swap(ended);
-    if (invalidated && active.empty() && threadRunning) {
-      const std::uint64_t one = 1;
-      (void)!::write(wakeFd, &one, sizeof one);
-    }
   }
   for (Ended& e : done) finish(std::move(e));
 }
@@ -470,7 +542,7 @@ void URLSessionCore::driveLocked(curl_socket_t socket, int events) {
     curl_multi_socket_action(multi, socket, events, &running);
   }
   // A zero time-out asks for another call straight away; should libcurl keep
-  // asking, rearmLocked() leaves it to the network thread.
+  // asking, rearmLocked() leaves it to the event thread.
   for (int round = 0; timeoutNow && round < 4; ++round) runTimeouts();
   int queued = 0;
   while (CURLMsg* message = curl_multi_info_read(multi, &queued)) {
@@ -480,6 +552,12 @@ void URLSessionCore::driveLocked(curl_socket_t socket, int events) {
     const CURLcode result = message->data.result;  // the message goes with the handle
     endLocked(transfer->task->taskIdentifier(), result, 0);
   }
+}
+
+void URLSessionCore::socketReady(curl_socket_t socket, std::uint32_t events) {
+  withLock([&] {
+    if (multi) driveLocked(socket, curlEvents(events));
+  });
 }
 
 void URLSessionCore::endLocked(std::uint64_t taskIdentifier, CURLcode result, std::int64_t code) {
@@ -505,44 +583,56 @@ void URLSessionCore::expireIdleLocked(Clock::time_point now) {
   for (std::uint64_t identifier : idle) endLocked(identifier, CURLE_OK, URLErrorTimedOut);
 }
 
-// The timer may fire early (a deadline moved out); it never fires late.
+// The timers may fire early (a deadline moved out); they never fire late.
 void URLSessionCore::rearmLocked() {
   if (timeoutNow) curlDeadline = Clock::now();
-  const Clock::time_point due = std::min(curlDeadline, idleCheck);
-  if (due >= armed) return;
-  armed = due;
-  const auto since = std::chrono::duration_cast<std::chrono::nanoseconds>(due.time_since_epoch());
-  itimerspec spec{};
-  spec.it_value.tv_sec = static_cast<time_t>(since.count() / 1'000'000'000);
-  spec.it_value.tv_nsec = static_cast<long>(since.count() % 1'000'000'000);
-  if (spec.it_value.tv_sec == 0 && spec.it_value.tv_nsec == 0) spec.it_value.tv_nsec = 1;
-  ::timerfd_settime(timerFd, TFD_TIMER_ABSTIME, &spec, nullptr);
+  if (curlDeadline != curlArmed && curlTimer) {
+    curlArmed = curlDeadline;
+    if (curlDeadline == Clock::time_point::max()) {
+      curlTimer->cancel();
+    } else {
+      curlTimer->schedule(curlDeadline);
+    }
+  }
+  const auto due = std::min(idleCheck, connectionsExpire);
+  if (due != sessionArmed && sessionTimer) {
+    sessionArmed = due;
+    if (due == Clock::time_point::max()) {
+      sessionTimer->cancel();
+    } else {
+      sessionTimer->schedule(due);
+    }
+  }
 }
 
 void URLSessionCore::submit(std::unique_ptr<Transfer> transfer) {
-  const bool usable = multi && epollFd >= 0 && timerFd >= 0 && wakeFd >= 0;
-  if (!usable || !configure(*transfer)) {
+  if (!configure(*transfer)) {
     const URLPtr url = transfer->request.URL();
     complete(std::move(transfer), std::nullopt, nullptr,
              makeURLError(URLErrorUnknown, "The request could not be prepared.", url));
     return;
   }
-  bool startThread = false;
+  bool refused = false;
   withLock([&] {
     // A cancel() that came first has found nothing to take out.
     if (invalidated || transfer->task->state() == URLSessionTask::State::canceling) return;
+    if (!multi && !makeMultiLocked()) {
+      refused = true;
+      return;
+    }
     Transfer& t = *transfer;
     t.lastActivity = Clock::now();
     idleCheck = std::min(idleCheck, t.lastActivity + t.idleTimeout);
+    connectionsExpire = Clock::time_point::max();
     curl_multi_add_handle(multi, t.easy);
     active.emplace(t.task->taskIdentifier(), std::move(transfer));
-    if (!threadRunning) threadRunning = startThread = true;
     driveLocked(CURL_SOCKET_TIMEOUT, 0);  // sends the request if it can
   });
-  if (startThread) std::thread([core = shared_from_this()] { core->run(); }).detach();
   if (transfer) {
     const URLPtr url = transfer->request.URL();
-    complete(std::move(transfer), std::nullopt, nullptr, cancelledError(url));
+    complete(std::move(transfer), std::nullopt, nullptr,
+             refused ? makeURLError(URLErrorUnknown, "The request could not be prepared.", url)
+                     : cancelledError(url));
   }
 }
 
@@ -564,13 +654,16 @@ void URLSessionCore::complete(std::unique_ptr<Transfer> transfer, std::optional<
                               HTTPURLResponsePtr response, ErrorPtr error) {
   URLSessionTaskPtr task = std::move(transfer->task);
   auto completion = std::move(transfer->completion);
-  transfer.reset();  // frees the easy handle on this thread
+  transfer.reset();                          // frees the easy handle on this thread
+  std::shared_ptr<URLSessionCore> released;  // dropped after the task's lock
   {
     // Under the task's lock, so that a cancel() deciding on the state cannot
     // overwrite "completed" with "canceling".
-    std::lock_guard lock(task->mutex_);
-    task->response_ = response;
-    task->error_ = error;
+    URLSessionTask::Impl& impl = *task->impl_;
+    std::lock_guard lock(impl.mutex);
+    impl.response = response;
+    impl.error = error;
+    released = std::move(impl.core);  // a finished task keeps nothing of the session
     task->state_ = URLSessionTask::State::completed;
   }
   delegateQueue->addOperationWithBlock([task, completion = std::move(completion),
@@ -599,6 +692,13 @@ void URLSessionCore::finish(Ended e) {
       auto error = makeURLError(
           URLErrorBadServerResponse, "The server's response headers are too large.", url,
           "More than " + std::to_string(t->headerLimit) + " bytes of response headers.");
+      complete(std::move(t), std::nullopt, nullptr, std::move(error));
+      return;
+    }
+    if (t->bodyTooLarge || result == CURLE_FILESIZE_EXCEEDED) {
+      auto error = makeURLError(
+          URLErrorDataLengthExceedsMaximum, "The resource exceeds the maximum size.", url,
+          "More than " + std::to_string(t->bodyLimit) + " bytes of response body.");
       complete(std::move(t), std::nullopt, nullptr, std::move(error));
       return;
     }
@@ -645,42 +745,6 @@ void URLSessionCore::finish(Ended e) {
   complete(std::move(t), std::move(body), std::move(response), nullptr);
 }
 
-void URLSessionCore::run() {
-  epoll_event events[32];
-  for (;;) {
-    const int count = ::epoll_wait(epollFd, events, 32, -1);
-    bool stop = false;
-    std::vector<Ended> done;
-    {
-      std::lock_guard lock(mutex);
-      bool timerFired = false;
-      for (int i = 0; i < count; ++i) {
-        const int fd = events[i].data.fd;
-        if (fd == timerFd || fd == wakeFd) {
-          std::uint64_t ticks = 0;
-          (void)!::read(fd, &ticks, sizeof ticks);
-          if (fd == timerFd) {
-            timerFired = true;
-            armed = Clock::time_point::max();
-          }
-        } else {
-          driveLocked(fd, curlEvents(events[i].events));
-        }
-      }
-      if (timerFired) {
-        const auto now = Clock::now();
-        if (now >= curlDeadline) driveLocked(CURL_SOCKET_TIMEOUT, 0);
-        if (now >= idleCheck) expireIdleLocked(now);
-      }
-      rearmLocked();
-      done.swap(ended);
-      if (invalidated && active.empty()) threadRunning = false, stop = true;
-    }
-    for (Ended& e : done) finish(std::move(e));
-    if (stop) return;
-  }
-}
-
 namespace {
 
 // Why a request cannot be sent, or an empty string.
@@ -710,26 +774,29 @@ std::string requestProblem(const URLRequest& request, std::int64_t& code) {
 
 // URLSessionTask
 
-URLSessionTask::URLSessionTask() : identifier_(gNextTaskIdentifier++) {}
+URLSessionTask::URLSessionTask()
+    : identifier_(gNextTaskIdentifier++), impl_(std::make_unique<Impl>()) {}
 
 URLSessionTask::~URLSessionTask() = default;
 
 HTTPURLResponsePtr URLSessionTask::response() const {
-  std::lock_guard lock(mutex_);
-  return response_;
+  std::lock_guard lock(impl_->mutex);
+  return impl_->response;
 }
 
 ErrorPtr URLSessionTask::error() const {
-  std::lock_guard lock(mutex_);
-  return error_;
+  std::lock_guard lock(impl_->mutex);
+  return impl_->error;
 }
 
 void URLSessionTask::resume() {
   std::unique_ptr<Transfer> transfer;
+  std::shared_ptr<URLSessionCore> core;  // held for the call: completing releases the task's
   {
-    std::lock_guard lock(mutex_);
-    if (state_ != State::suspended || !pending_ || !core_) return;
-    transfer = std::move(pending_);
+    std::lock_guard lock(impl_->mutex);
+    if (state_ != State::suspended || !impl_->pending || !impl_->core) return;
+    transfer = std::move(impl_->pending);
+    core = impl_->core;
     state_ = State::running;
   }
   transfer->task = std::static_pointer_cast<URLSessionTask>(shared_from_this());
@@ -737,27 +804,29 @@ void URLSessionTask::resume() {
   const std::string problem = requestProblem(transfer->request, code);
   if (!problem.empty()) {
     const URLPtr url = transfer->request.URL();
-    core_->complete(std::move(transfer), std::nullopt, nullptr, makeURLError(code, problem, url));
+    core->complete(std::move(transfer), std::nullopt, nullptr, makeURLError(code, problem, url));
     return;
   }
-  core_->submit(std::move(transfer));
+  core->submit(std::move(transfer));
 }
 
 void URLSessionTask::cancel() {
   std::unique_ptr<Transfer> suspended;
+  std::shared_ptr<URLSessionCore> core;
   {
-    std::lock_guard lock(mutex_);
+    std::lock_guard lock(impl_->mutex);
     if (state_ != State::suspended && state_ != State::running) return;
-    if (!core_) return;
-    if (state_ == State::suspended) suspended = std::move(pending_);
+    if (!impl_->core) return;
+    core = impl_->core;
+    if (state_ == State::suspended) suspended = std::move(impl_->pending);
     state_ = State::canceling;
   }
   if (suspended) {
     suspended->task = std::static_pointer_cast<URLSessionTask>(shared_from_this());
     const URLPtr url = suspended->request.URL();
-    core_->complete(std::move(suspended), std::nullopt, nullptr, cancelledError(url));
+    core->complete(std::move(suspended), std::nullopt, nullptr, cancelledError(url));
   } else {
-    core_->requestCancel(identifier_);
+    core->requestCancel(identifier_);
   }
 }
 
@@ -778,7 +847,9 @@ URLSession::URLSession(URLSessionConfiguration configuration,
         queue->setName("kivi.URLSession.delegateQueue");
         return queue;
       }()),
-      core_(std::make_shared<URLSessionCore>(configuration_, delegateQueue_)) {}
+      core_(std::make_shared<URLSessionCore>(configuration_, delegateQueue_)) {
+  core_->makeTimers();
+}
 
 URLSession::~URLSession() { core_->invalidate(/*cancelRunning=*/false); }
 
@@ -798,11 +869,12 @@ URLSessionDataTaskPtr URLSession::dataTaskWithRequest(const URLRequest& request,
                                                       DataTaskCompletionHandler completionHandler) {
   auto task = std::shared_ptr<URLSessionDataTask>(new URLSessionDataTask());
   task->original_ = request;
-  task->core_ = core_;
   auto transfer = std::make_unique<Transfer>();
   transfer->request = request;
   transfer->completion = std::move(completionHandler);
-  task->pending_ = std::move(transfer);
+  std::lock_guard lock(task->impl_->mutex);
+  task->impl_->core = core_;
+  task->impl_->pending = std::move(transfer);
   return task;
 }
 

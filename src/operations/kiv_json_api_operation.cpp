@@ -95,6 +95,9 @@ void KivJSONAPIOperation::startNetworkRequest() {
         self->didCompleteUrlRequest(request, data, std::move(response), std::move(error));
       });
   setSessionTaskOperationHandle(task);
+  // A cancel() that came after start() looked at the flag found no task to
+  // cancel; it set the flag before looking, so the flag shows it here.
+  if (isCancelled()) task->cancel();
   if (auto stored = sessionTaskOperationHandle()) stored->resume();
 }
 

@@ -157,6 +157,51 @@ TEST(OperationQueue, BlockingWaitsReturnOnceTheWorkIsDone) {
   }
 }
 
+// As many operations as the default limit runs, all started, then each
+// waiting for work of a second queue, some through waitUntilFinished() and
+// some on a signal the pool cannot see: the second queue's work still runs.
+TEST(OperationQueue, OperationsWaitingOnAnotherQueueDoNotStarveIt) {
+  auto outer = std::make_shared<OperationQueue>(), inner = std::make_shared<OperationQueue>();
+  auto started = std::make_shared<Signal>();
+  std::atomic<int> done{0};
+  const int count = static_cast<int>(OperationQueue::kDefaultConcurrency);
+  for (int i = 0; i < count; ++i) {
+    outer->addOperation(blockOp([=, &done, silent = i % 4 == 0] {
+      started->notify();
+      EXPECT_TRUE(started->wait(count));
+      auto signal = std::make_shared<Signal>();
+      auto op = blockOp([signal] { signal->notify(); });
+      inner->addOperation(op);
+      if (silent) {
+        EXPECT_TRUE(signal->wait());
+      } else {
+        op->waitUntilFinished();
+      }
+      ++done;
+    }));
+  }
+  ASSERT_TRUE(testing::returnsWithin([outer] { outer->waitUntilAllOperationsAreFinished(); }));
+  EXPECT_EQ(done, count);
+}
+
+// A dependency added after the queue picked a ready operation, before it
+// called start(): the operation is turned away by start(), waits for the
+// dependency and then runs, instead of staying in the running list for ever.
+TEST(OperationQueue, DependencyAddedWhileTheQueueStartsTheOperation) {
+  auto queue = std::make_shared<OperationQueue>();
+  std::atomic<int> runs{0};
+  constexpr int kRounds = 30'000;
+  for (int i = 0; i < kRounds; ++i) {
+    auto dependency = blockOp([] {});
+    auto op = blockOp([&runs] { ++runs; });
+    queue->addOperation(op);
+    op->addDependency(dependency);
+    dependency->start();
+  }
+  ASSERT_TRUE(testing::returnsWithin([queue] { queue->waitUntilAllOperationsAreFinished(); }));
+  EXPECT_EQ(runs, kRounds);
+}
+
 TEST(OperationQueue, CancelAllOperations) {
   auto queue = std::make_shared<OperationQueue>();
   queue->setMaxConcurrentOperationCount(1);

@@ -51,6 +51,22 @@ TEST(Operation, StartRunsMainOnceAnnouncesTheStatesAndCompletes) {
   EXPECT_EQ(state->completions, 1);
 }
 
+// Every transition is announced before and after, in the order observers of
+// the queue rely on.
+TEST(Operation, StartAnnouncesEachChangeBeforeAndAfter) {
+  auto op = std::make_shared<BlockOperation>([] {});
+  auto recorder =
+      Recorder::watch(*op, {"isExecuting", "isFinished"}, kNew | KeyValueObservingOptionPrior);
+  op->start();
+  using testing::Event;
+  EXPECT_EQ(recorder->takeEvents(), (std::vector<Event>{{"will", "isExecuting"},
+                                                        {"did", "isExecuting"},
+                                                        {"will", "isExecuting"},
+                                                        {"will", "isFinished"},
+                                                        {"did", "isFinished"},
+                                                        {"did", "isExecuting"}}));
+}
+
 TEST(Operation, ReadinessFollowsDependenciesAndCancellation) {
   auto runs = std::make_shared<std::atomic<int>>(0);
   auto dependency = counting(runs), op = counting(runs);

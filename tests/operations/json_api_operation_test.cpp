@@ -34,12 +34,14 @@ class Call : public KivJSONAPIOperation {
   using KivJSONAPIOperation::KivJSONAPIOperation;
   std::optional<StringDictionary> query, headers;  // set before queueing
   std::optional<Value> body;
-  std::optional<bool> preFlight;  // none: the base class decides
-  double timeout = 0;             // 0: as the base class builds it
+  std::optional<bool> preFlight;   // none: the base class decides
+  bool cancelInPreFlight = false;  // a cancel() that lands inside start()
+  double timeout = 0;              // 0: as the base class builds it
   std::atomic<int> processCalls{0}, completions{0};
   std::atomic<bool> cancelledWhenTaskCompleted{false};
 
   bool performPreFlightChecks() override {
+    if (cancelInPreFlight) cancel();
     return preFlight.value_or(KivJSONAPIOperation::performPreFlightChecks());
   }
   std::optional<StringDictionary> additionalQueryParameters() override { return query; }
@@ -106,6 +108,7 @@ TEST_F(JSONAPIOperationTest, EveryEndingFollowsTheFailureTable) {
   const Hook noPreFlight = [](Call& op) { op.preFlight = false; };
   const Hook nanBody = [](Call& op) { op.body = Value(Dictionary{{"n", Value(std::nan(""))}}); };
   const Hook cancel = [](Call& op) { op.cancel(); };
+  const Hook cancelInStart = [](Call& op) { op.cancelInPreFlight = true; };
   const auto header = [](std::string value) {
     return [value](Call& op) { op.headers = StringDictionary{{"X-Bad", value}}; };
   };
@@ -159,6 +162,8 @@ TEST_F(JSONAPIOperationTest, EveryEndingFollowsTheFailureTable) {
       {"pre-flight check refused", "/never", kInvalidInput, 0, noPreFlight},
       {"body object not JSON", "/never", kFailedToBuild, 1, nanBody},
       {"cancelled before start", "/never", kCancelled, 0, cancel},
+      {"cancelled inside start, before the task exists", "/never", kCancelled, URLErrorCancelled,
+       cancelInStart},
   };
   for (const auto& c : cases) {
     SCOPED_TRACE(c.name);
@@ -231,12 +236,20 @@ TEST_F(JSONAPIOperationTest, SendsQueryHeadersAndBodyAsTheHooksSay) {
           "HTTP/1.1 200 OK\r\nContent-Type: application/json\r\nContent-Length: 2\r\n\r\n{}");
     }
   });
-  for (const bool hooks : {false, true}) {
+  // Extra fields: none; one that replaces the default of the same name; one
+  // whose name differs only in case, sent beside the default.
+  const std::optional<StringDictionary> extras[] = {
+      std::nullopt, StringDictionary{{"Accept", "text/plain"}, {"X-Extra", "1"}},
+      StringDictionary{{"accept", "text/plain"}}};
+  const char* accepts[] = {"\r\nAccept: application/json\r\n", "\r\nAccept: text/plain\r\n",
+                           "\r\nAccept: application/json\r\n"};
+  for (int row = 0; row < 3; ++row) {
+    SCOPED_TRACE(row);
+    const bool hooks = row == 1;
     auto op = call(raw.url("/json?x=2"));
     op->query = StringDictionary{{"v", hooks ? "a&b=c+d e/\xC3\xA9#f" : "1"}};
-    // An extra field replaces the default of the same name; a body goes out
-    // even with GET, pretty-printed.
-    if (hooks) op->headers = StringDictionary{{"Accept", "text/plain"}, {"X-Extra", "1"}};
+    op->headers = extras[row];
+    // A body goes out even with GET, pretty-printed.
     if (hooks) op->body = Value(Dictionary{{"k", Value("v")}, {"n", Value(Array{1, 2})}});
     service.operationQueue()->addOperation(op);
     finish(op);
@@ -246,9 +259,9 @@ TEST_F(JSONAPIOperationTest, SendsQueryHeadersAndBodyAsTheHooksSay) {
     const std::string query = hooks ? "v=a%26b%3Dc%2Bd%20e/%C3%A9%23f" : "v=1";
     EXPECT_TRUE(head.starts_with("GET /json?x=2&" + query + " ")) << head;
     EXPECT_THAT(head, ::testing::HasSubstr("\r\nContent-Type: application/json\r\n"));
-    EXPECT_THAT(head, ::testing::HasSubstr(hooks ? "\r\nAccept: text/plain\r\n"
-                                                 : "\r\nAccept: application/json\r\n"));
+    EXPECT_THAT(head, ::testing::HasSubstr(accepts[row]));
     EXPECT_EQ(head.find("Accept:"), head.rfind("Accept:"));
+    EXPECT_EQ(head.find("\r\naccept: text/plain\r\n") != std::string::npos, row == 2);
     EXPECT_EQ(head.find("\r\nX-Extra: 1\r\n") != std::string::npos, hooks);
     std::string body;
     if (hooks) {
@@ -258,6 +271,23 @@ TEST_F(JSONAPIOperationTest, SendsQueryHeadersAndBodyAsTheHooksSay) {
     }
     EXPECT_EQ(received.substr(head.size() + 2), body);
   }
+}
+
+// Host operations that block waiting for REST calls, as many as the pool has
+// threads and more: the calls' completions still run.
+TEST_F(JSONAPIOperationTest, OperationsWaitingOnCallsDoNotStarveTheirCompletions) {
+  auto hosts = std::make_shared<OperationQueue>();
+  std::atomic<int> succeeded{0};
+  for (int i = 0; i < 64; ++i) {
+    hosts->addOperation(std::make_shared<BlockOperation>([&] {
+      auto op = call(http.url("/json"));
+      service.operationQueue()->addOperation(op);
+      op->waitUntilFinished();
+      if (op->completionStatus() == kSuccess) ++succeeded;
+    }));
+  }
+  ASSERT_TRUE(testing::returnsWithin([hosts] { hosts->waitUntilAllOperationsAreFinished(); }));
+  EXPECT_EQ(succeeded, 64);
 }
 
 TEST_F(JSONAPIOperationTest, ReleasedWhileRunningDropsTheResult) {

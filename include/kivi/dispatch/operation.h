@@ -27,11 +27,8 @@
 // observed.
 #pragma once
 
-#include <atomic>
-#include <cstdint>
 #include <functional>
 #include <memory>
-#include <mutex>
 #include <string>
 #include <vector>
 
@@ -40,8 +37,8 @@
 namespace kivi {
 
 namespace detail {
+struct OperationState;
 struct QueueCore;
-class SlotList;
 }  // namespace detail
 
 class Operation;
@@ -49,7 +46,7 @@ using OperationPtr = std::shared_ptr<Operation>;
 
 class Operation : public Object {
  public:
-  Operation() = default;
+  Operation();
   ~Operation() override;
 
   // Base behaviour for a synchronous operation: refused (ignored) when
@@ -75,15 +72,16 @@ class Operation : public Object {
   // "isReady". Adding the operation itself, or null, is ignored.
   void addDependency(const OperationPtr& operation);
   void removeDependency(const OperationPtr& operation);
-  std::vector<OperationPtr> dependencies() const;
+  [[nodiscard]] std::vector<OperationPtr> dependencies() const;
 
-  std::function<void()> completionBlock() const;
+  [[nodiscard]] std::function<void()> completionBlock() const;
   void setCompletionBlock(std::function<void()> block);
 
-  std::string name() const;
+  [[nodiscard]] std::string name() const;
   void setName(std::string name);
 
-  // Blocks until the operation has finished.
+  // Blocks until the operation has finished and its queue, if any, has let
+  // it go. A worker of the pool counts as blocked meanwhile.
   void waitUntilFinished();
 
   // "isReady", "isExecuting", "isFinished", "isCancelled", "isAsynchronous",
@@ -95,45 +93,12 @@ class Operation : public Object {
 
  private:
   friend struct detail::QueueCore;
-  friend class detail::SlotList;
 
   void didFinish();
   // Marks the finish as complete (its queue has let go) and wakes waiters.
   void deliverFinish();
-  std::shared_ptr<detail::QueueCore> queueCore() const;
 
-  mutable std::mutex mutex_;
-  std::vector<OperationPtr> dependencies_;            // guarded by mutex_
-  std::vector<std::weak_ptr<Operation>> dependents_;  // guarded by mutex_
-  std::function<void()> completionBlock_;             // guarded by mutex_
-  std::string name_;                                  // guarded by mutex_
-  std::weak_ptr<detail::QueueCore> queue_;            // guarded by mutex_; set once
-
-  std::atomic<bool> cancelled_{false};
-  std::atomic<bool> baseStarted_{false};
-  std::atomic<bool> baseExecuting_{false};
-  std::atomic<bool> baseFinished_{false};
-  std::atomic<bool> finishHandled_{false};
-  // Set, and waiters woken, once everything finishing entails is done.
-  std::atomic<bool> finishDelivered_{false};
-  std::atomic<bool> cancelAnnounced_{false};
-  std::atomic<bool> queueStarted_{false};
-  std::atomic<bool> enqueued_{false};
-  std::atomic<std::size_t> dependencyCount_{0};  // dependencies_.size()
-
-  // The queue's bookkeeping, guarded by the owning QueueCore's mutex.
-  struct QueueSlot {
-    bool listed = false;   // in the queue's pending or running list
-    bool started = false;  // the queue has called (or is calling) start()
-    bool done = false;     // the queue has seen it finish
-    bool ready = false;    // last readiness the queue read
-    std::uint64_t readyEpoch = 0;
-    std::uint64_t sequence = 0;
-    OperationPtr held;              // the queue's reference while listed
-    Operation* previous = nullptr;  // links of the pending or running list
-    Operation* next = nullptr;
-  } slot_;
-  std::atomic<std::uint64_t> readyEpoch_{0};
+  const std::unique_ptr<detail::OperationState> state_;
 };
 
 // An operation whose work is a function.

@@ -3,7 +3,8 @@
 //
 // Header field names are matched without regard to ASCII case: setting
 // "content-type" replaces a "Content-Type" set earlier (the first spelling is
-// kept). allHTTPHeaderFields() gives every field once.
+// kept). setAllHTTPHeaderFields() is the exception: it takes the dictionary as
+// it is, so "Accept" and "accept" given together are two fields, both sent.
 //
 //   kivi::MutableURLRequest request(url);
 //   request.setHTTPMethod("POST");
@@ -24,8 +25,8 @@
 #include <utility>
 #include <vector>
 
-#include "kivi/net/url.h"
 #include "kivi/base/value.h"
+#include "kivi/net/url.h"
 
 namespace kivi {
 
@@ -81,7 +82,8 @@ class MutableURLRequest : public URLRequest {
   void setValue(std::optional<std::string> value, std::string_view field);
   // Appends to the field's value, comma-separated, or sets it.
   void addValue(std::string_view value, std::string_view field);
-  // Replaces every field with `fields`; none removes them all.
+  // Replaces every field with the entries of `fields`, each its own field
+  // (keys that differ only in case included); none removes them all.
   void setAllHTTPHeaderFields(const std::optional<StringDictionary>& fields);
 };
 

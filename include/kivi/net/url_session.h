@@ -1,14 +1,17 @@
 // URLSession: HTTP and HTTPS transfers on libcurl.
 //
-// A session owns one libcurl multi handle: connections are reused between
-// tasks, HTTP/2 is used over TLS where the server offers it, certificates are
-// checked against the system's store, redirects are followed (at most 16), and
-// gzip, deflate and brotli answers are decoded. resume() sends the request on
-// the calling thread as far as the socket takes it; a network thread of the
-// session's own, started with its first task, waits for answers and
-// deadlines. Each task's completion handler runs on the session's delegate
-// queue (a serial OperationQueue unless one is given), never inline on the
-// thread that resumed or cancelled the task.
+// A session owns one libcurl multi handle: connections are kept and reused
+// between tasks (at most HTTPMaximumConnectionsPerHost to one host; an idle
+// connection is closed after 90 seconds without use, or when the server
+// closes it), HTTP/2 is used over TLS where the server offers it and
+// concurrent requests to one host then share one connection, certificates are
+// checked against the system's store, redirects are followed (at most 16),
+// and gzip, deflate and brotli answers are decoded. resume() sends the
+// request on the calling thread as far as the socket takes it; the library's
+// event thread then waits for the answer and for deadlines. Each task's
+// completion handler runs on the session's delegate queue (a serial
+// OperationQueue unless one is given), never inline on the thread that
+// resumed or cancelled the task.
 //
 //   auto session = kivi::URLSession::sessionWithConfiguration(
 //       kivi::URLSessionConfiguration::defaultSessionConfiguration());
@@ -21,34 +24,39 @@
 // (-999), timed out (-1001: no byte moved for the request's time-out),
 // cannot find host (-1003), cannot connect (-1004), connection lost (-1005),
 // too many redirects (-1007), bad server response (-1011), cannot parse
-// response (-1017), unsupported URL (-1002), secure connection failed
-// (-1200) and others; the user info holds a readable description and the
-// failing URL (URLErrorFailingURLErrorKey, URLErrorFailingURLStringErrorKey).
-// A request whose header names or values hold CR, LF or NUL is not sent: the
-// task fails with URLErrorBadURL and a description naming the field.
+// response (-1017), unsupported URL (-1002), data length exceeds maximum
+// (-1103: a body larger than maximumResponseBodyBytes, declared or received),
+// secure connection failed (-1200) and others; the user info holds a
+// readable description and the failing URL (URLErrorFailingURLErrorKey,
+// URLErrorFailingURLStringErrorKey). A request whose header names or values
+// hold CR, LF or NUL is not sent: the task fails with URLErrorBadURL and a
+// description naming the field.
+//
+// Resources: a session holds its connections while it is in use. A finished
+// task keeps nothing of the session; releasing the last reference to a
+// session (or invalidating it) lets its running tasks finish, then closes
+// its connections; so does 90 seconds without a transfer.
 //
 // Thread contract: every member may be called from any thread. Releasing the
-// last reference to a session lets its running tasks finish, then stops its
-// thread; invalidateAndCancel() cancels them instead.
+// last reference to a session lets its running tasks finish;
+// invalidateAndCancel() cancels them instead.
 #pragma once
 
 #include <atomic>
 #include <cstdint>
 #include <functional>
 #include <memory>
-#include <mutex>
 #include <optional>
 
 #include "kivi/base/error.h"
-#include "kivi/net/http_url_response.h"
 #include "kivi/base/object.h"
 #include "kivi/dispatch/operation_queue.h"
+#include "kivi/net/http_url_response.h"
 #include "kivi/net/url_request.h"
 
 namespace kivi {
 
 struct URLSessionCore;
-struct Transfer;
 
 inline constexpr const char* URLErrorDomain = "NSURLErrorDomain";
 inline constexpr std::int64_t URLErrorUnknown = -1;
@@ -89,6 +97,9 @@ struct URLSessionConfiguration {
   // Answers whose header block exceeds this fail with
   // URLErrorBadServerResponse.
   std::size_t maximumResponseHeaderBytes = 256 * 1024;
+  // Answers whose body (after content decoding) exceeds this fail with
+  // URLErrorDataLengthExceedsMaximum, as soon as it is declared or received.
+  std::size_t maximumResponseBodyBytes = 256 * 1024 * 1024;
 };
 
 class URLSessionTask : public Object {
@@ -119,15 +130,12 @@ class URLSessionTask : public Object {
  private:
   friend class URLSession;
   friend struct URLSessionCore;
+  struct Impl;
 
   const std::uint64_t identifier_;
   std::optional<URLRequest> original_;
   std::atomic<State> state_{State::suspended};
-  std::shared_ptr<URLSessionCore> core_;  // set at creation; keeps the session's state alive
-  mutable std::mutex mutex_;
-  std::unique_ptr<Transfer> pending_;  // guarded by mutex_: the request until resume()
-  HTTPURLResponsePtr response_;        // guarded by mutex_
-  ErrorPtr error_;                     // guarded by mutex_
+  const std::unique_ptr<Impl> impl_;
 };
 
 class URLSessionDataTask : public URLSessionTask {

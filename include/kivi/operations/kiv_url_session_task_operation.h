@@ -16,7 +16,8 @@
 // Thread contract: cancel() may come from any thread; it reads the stored
 // task once, after the cancelled flag is set. A cancel that arrives after
 // start() checked isCancelled() but before it stored the task reaches no
-// task, and the request runs to its normal end. The fields are read and
+// task, so start() looks at isCancelled() again once the task is stored and
+// cancels it itself (KivJSONAPIOperation does). The fields are read and
 // written under a small lock; nothing else is synchronised.
 #pragma once
 
