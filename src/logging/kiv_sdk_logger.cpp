@@ -171,15 +171,19 @@ std::string KivSdkLogger::nsStringFromCString(const char* cString) {
 void KivSdkLogger::log(bool aot, KivSdkNullableString module, KivSdkLogLevel logLevel,
                        const char* fileName, const char* functionName, std::uint64_t lineNumber,
                        KivSdkNullableString formatString, std::span<const FormatArg> args) const {
+  // The line is built before anything decides whether it is delivered, so a
+  // description() with side effects runs the same way for every line.
+  const std::string_view moduleText = module.valueOr(kUnknown);
+  const std::string_view fileText = cStringView(fileName);
+  const std::string_view functionText = cStringView(functionName);
+  MessageBuffer message;
+  if (!formatString.isNull()) appendFormat(message.text(), formatString.valueOr({}), args);
+
   if (logLevel < 1 || logLevel > (aot ? 4u : 6u)) return;
   const std::shared_ptr<KivSdkLoggerDelegate> target = delegate();
   if (!target || (aot && !target->implementsAotLog(logLevel))) return;
-
-  MessageBuffer message;
-  if (!formatString.isNull()) appendFormat(message.text(), formatString.valueOr({}), args);
   const Method method = (aot ? kAotMethods : kMainMethods)[logLevel - 1];
-  ((*target).*method)(module.valueOr(kUnknown), cStringView(fileName), cStringView(functionName),
-                      lineNumber, message.text());
+  ((*target).*method)(moduleText, fileText, functionText, lineNumber, message.text());
 }
 
 }  // namespace kivi

@@ -3,8 +3,8 @@
 #include <algorithm>
 
 #include "kivi/net/http_cookie.h"
-#include "kivi/text/unicode_text.h"
 #include "kivi/net/url_components.h"
+#include "kivi/text/unicode_text.h"
 
 namespace kivi {
 
@@ -18,31 +18,29 @@ Value masked(const Value& value) {
   return Value(text ? masked(*text) : kMask);
 }
 
-const StringDictionary& textFields(const StringDictionary& headers) { return headers; }
-StringDictionary textFields(const Dictionary& headers) {
-  StringDictionary fields;
-  for (const auto& [name, value] : headers) {
-    if (const std::string* text = value.asString()) fields.emplace(name, *text);
-  }
-  return fields;
-}
+const std::string* text(const std::string& value) { return &value; }
+const std::string* text(const Value& value) { return value.asString(); }
 
 // Masks "Authorization" and rewrites "Set-Cookie" in place; works on both
-// header dictionary forms.
+// header dictionary forms. Names are matched exactly: the cookies come from
+// the field spelt "Set-Cookie" alone, never from a "set-cookie" beside it.
 template <class Headers>
 void redact(Headers& headers, const URLPtr& url) {
   if (auto authorization = headers.find("Authorization"); authorization != headers.end()) {
     authorization->second = masked(authorization->second);
   }
   if (!url) return;
-  const auto cookies = HTTPCookie::cookiesWithResponseHeaderFields(textFields(headers), *url);
+  const auto field = headers.find("Set-Cookie");
+  const std::string* value = field == headers.end() ? nullptr : text(field->second);
+  if (!value) return;
+  const auto cookies = HTTPCookie::cookiesWithResponseHeaderFields({{"Set-Cookie", *value}}, *url);
   if (cookies.empty()) return;
   std::string list;
   for (const HTTPCookiePtr& cookie : cookies) {
     list += cookie->name() + "=" + masked(cookie->value()) + ", path=" + cookie->path() +
             ", domain=" + cookie->domain() + ";";
   }
-  headers.insert_or_assign("Set-Cookie", std::move(list));
+  field->second = std::move(list);
 }
 
 bool kept(const std::string& name, const std::vector<std::string>& keep) {

@@ -29,7 +29,14 @@ std::shared_ptr<OperationQueueProtocol> KivAsyncServiceObjC::operationQueue() co
 }
 
 void KivAsyncServiceObjC::setOperationQueue(std::shared_ptr<OperationQueueProtocol> queue) {
+  willChangeValueForKey("operationQueue");
   operationQueue_ = std::move(queue);
+  didChangeValueForKey("operationQueue");
+}
+
+Value KivAsyncServiceObjC::valueForKey(std::string_view key) const {
+  if (key == "operationQueue") return Value(std::dynamic_pointer_cast<Object>(operationQueue()));
+  return Object::valueForKey(key);
 }
 
 KivAsyncService::KivAsyncService(std::string operationQueueName,
@@ -108,7 +115,9 @@ bool KivAtomicWorkflowService::isAtomicWorkflowInProgress() const {
 }
 
 void KivAtomicWorkflowService::setIsAtomicWorkflowInProgress(bool inProgress) {
+  willChangeValueForKey("isAtomicWorkflowInProgress");
   isAtomicWorkflowInProgress_ = inProgress;
+  didChangeValueForKey("isAtomicWorkflowInProgress");
 }
 
 std::shared_ptr<RecursiveLock> KivAtomicWorkflowService::atomicWorkFlowLock() const {
@@ -116,7 +125,10 @@ std::shared_ptr<RecursiveLock> KivAtomicWorkflowService::atomicWorkFlowLock() co
 }
 
 void KivAtomicWorkflowService::setAtomicWorkFlowLock(std::shared_ptr<RecursiveLock> lock) {
-  if (lock) atomicWorkFlowLock_ = std::move(lock);
+  if (!lock) return;
+  willChangeValueForKey("atomicWorkFlowLock");
+  atomicWorkFlowLock_ = std::move(lock);
+  didChangeValueForKey("atomicWorkFlowLock");
 }
 
 std::shared_ptr<PendingOperationList> KivAtomicWorkflowService::pendingOperations() const {
@@ -125,7 +137,24 @@ std::shared_ptr<PendingOperationList> KivAtomicWorkflowService::pendingOperation
 
 void KivAtomicWorkflowService::setPendingOperations(
     std::shared_ptr<PendingOperationList> pendingOperations) {
-  if (pendingOperations) pendingOperations_ = std::move(pendingOperations);
+  if (!pendingOperations) return;
+  willChangeValueForKey("pendingOperations");
+  pendingOperations_ = std::move(pendingOperations);
+  didChangeValueForKey("pendingOperations");
+}
+
+Value KivAtomicWorkflowService::valueForKey(std::string_view key) const {
+  if (key == "isAtomicWorkflowInProgress") return Value(isAtomicWorkflowInProgress());
+  if (key == "atomicWorkFlowLock") return Value(atomicWorkFlowLock());
+  if (key == "pendingOperations") {
+    const auto pending = pendingOperations();
+    if (!pending) return Value();
+    Array operations;
+    operations.reserve(pending->size());
+    for (const OperationPtr& operation : *pending) operations.emplace_back(operation);
+    return Value(std::move(operations));
+  }
+  return KivAsyncServiceObjC::valueForKey(key);
 }
 
 }  // namespace kivi

@@ -6,8 +6,6 @@
 #include <string>
 #include <vector>
 
-#include "kivi/launch/tev_app_launch_constants.h"
-
 namespace kivi {
 namespace {
 
@@ -110,16 +108,6 @@ TEST(KivUloFileParserTest, LargeAdversarialTextsStayBounded) {
   // Quadratic for the engine: the step budget ends the search.
   const std::string line(256 << 10, 'a');
   EXPECT_EQ(KivUloFileParser(line + "\n").getValue(".*.*b"), nullopt);
-}
-
-TEST(TEVAppLaunchConstantsTest, AnswersTheFixedStrings) {
-  TEVAppLaunchConstants constants;
-  (void)constants;
-  EXPECT_EQ(TEVAppLaunchConstants::clientAddress(), "127.0.0.1");
-  EXPECT_EQ(TEVAppLaunchConstants::zorvikTransactionIdHeaderName(), "Zorvik-TransactionId");
-  EXPECT_EQ(TEVAppLaunchConstants::contentTypeHeader(), "Content-Type");
-  EXPECT_EQ(TEVAppLaunchConstants::launchMimeType(), "application/vnd.zorvik.launchparams+xml");
-  EXPECT_EQ(&TEVAppLaunchConstants::launchMimeType(), &TEVAppLaunchConstants::launchMimeType());
 }
 
 }  // namespace

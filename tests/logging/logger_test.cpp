@@ -147,16 +147,26 @@ TEST(KivSdkLogger, BadInputIsAbsorbed) {
   EXPECT_EQ(KivSdkLogger::nsStringFromCString("\xed\xa0\x80"), "<unknown>");  // a surrogate
 }
 
-TEST(KivSdkLogger, DroppedLinesAreNeverFormatted) {
+// The message is built before the level and the delegate are looked at, so
+// an argument's description runs once per call, delivered or not; without a
+// format string the arguments are never touched.
+TEST(KivSdkLogger, EveryLineIsFormattedEvenWhenDropped) {
   auto object = std::make_shared<Counted>();
   auto mainOnly = std::make_shared<Recorder>(0);
   const auto logger = KivSdkLogger::create();
-  logger->logWithModule("m", 4, "f", "g", 1, "%@", object);  // no delegate
+  logger->logWithModule("m", 4, "f", "g", 1, "%@", object);     // no delegate
+  logger->aotLogWithModule("m", 1, "f", "g", 1, "%@", object);  // no delegate
   logger->setDelegate(mainOnly);
+  logger->logWithModule("m", 0, "f", "g", 1, "%@", object);     // no such level
   logger->logWithModule("m", 9, "f", "g", 1, "%@", object);     // no such level
+  logger->aotLogWithModule("m", 5, "f", "g", 1, "%@", object);  // no aot level 5
   logger->aotLogWithModule("m", 4, "f", "g", 1, "%@", object);  // not implemented
-  EXPECT_EQ(object->calls, 0);
+  EXPECT_EQ(object->calls, 6);
   EXPECT_TRUE(mainOnly->take().empty());
+  logger->logWithModule("m", 4, "f", "g", 1, nullptr, object);
+  logger->logWithModule("m", 9, "f", "g", 1, nullptr, object);
+  EXPECT_EQ(object->calls, 6);
+  EXPECT_EQ(mainOnly->take().size(), 1u);
 }
 
 TEST(KivSdkLogger, HoldsTheDelegateWeakly) {

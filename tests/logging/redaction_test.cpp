@@ -5,8 +5,8 @@
 #include <string>
 #include <vector>
 
-#include "kivi/net/url_components.h"
 #include "kivi/logging/log_redaction.h"
+#include "kivi/net/url_components.h"
 #include "kivi/utils/url_utils.h"
 
 namespace kivi {
@@ -48,14 +48,15 @@ TEST(ResponseHeadersForLoggingTest, MasksAuthorizationAndRewritesCookies) {
                                {"Set-Cookie", "a=1, b="},
                                {"set-cookie", "c=2"},
                                {"X", "y"}});
+  // Names match exactly: "set-cookie" adds no cookie and keeps its value.
   EXPECT_EQ(*KivSdkResponseHeadersForLogging(fields, url),
             (StringDictionary{{"Authorization", "***"},
                               {"authorization", "t"},
-                              {"Set-Cookie",
-                               "a=***, path=/, domain=d;b=, path=/, domain=d;c=***, "
-                               "path=/, domain=d;"},
+                              {"Set-Cookie", "a=***, path=/, domain=d;b=, path=/, domain=d;"},
                               {"set-cookie", "c=2"},
                               {"X", "y"}}));
+  EXPECT_EQ(*KivSdkResponseHeadersForLogging(headers({{"set-cookie", "c=2"}}), url),
+            (StringDictionary{{"set-cookie", "c=2"}}));
   // No URL, or no cookie parsed: the field stays as it came.
   EXPECT_EQ(
       *KivSdkResponseHeadersForLogging(headers({{"Authorization", ""}, {"Set-Cookie", "a"}}), url),
@@ -67,10 +68,13 @@ TEST(ResponseHeadersForLoggingTest, MasksAuthorizationAndRewritesCookies) {
 
   // Values of other kinds, as an error's user info may hold them.
   const Dictionary values{{"Authorization", 42}, {"Set-Cookie", Data{'a'}}, {"set-cookie", "b=2"}};
-  EXPECT_EQ(*KivSdkResponseHeadersForLogging(Value(values), url).asDictionary(),
-            (Dictionary{{"Authorization", "***"},
-                        {"Set-Cookie", "b=***, path=/, domain=d;"},
-                        {"set-cookie", "b=2"}}));
+  EXPECT_EQ(
+      *KivSdkResponseHeadersForLogging(Value(values), url).asDictionary(),
+      (Dictionary{{"Authorization", "***"}, {"Set-Cookie", Data{'a'}}, {"set-cookie", "b=2"}}));
+  EXPECT_EQ(*KivSdkResponseHeadersForLogging(
+                 Value(Dictionary{{"Set-Cookie", "a=1"}, {"set-cookie", "b=2"}}), url)
+                 .asDictionary(),
+            (Dictionary{{"Set-Cookie", "a=***, path=/, domain=d;"}, {"set-cookie", "b=2"}}));
   const Value empty{Dictionary{}};
   EXPECT_EQ(KivSdkResponseHeadersForLogging(empty, url).asDictionary(), empty.asDictionary());
   EXPECT_EQ(KivSdkObfuscateHeadersForLogging(Value(values), {"Authorization"}),

@@ -121,6 +121,59 @@ TEST_F(URLSessionTest, ReusesOneConnectionAndReadsOtherHeaderBytesAsLatin1) {
   EXPECT_EQ(raw.connections(), 1);
 }
 
+// Names come out capitalised word by word whatever their letter case on the
+// wire; a field sent several times is one entry, its values joined by ", " in
+// arrival order.
+TEST_F(URLSessionTest, CanonicalisesHeaderNamesAndJoinsRepeatedFields) {
+  RawServer raw([](RawConnection& connection) {
+    while (connection.readRequest()) {
+      connection.write(
+          "HTTP/1.1 200 OK\r\nCONTENT-TYPE: application/json\r\nx-rEQUEST-iD: 7\r\n"
+          "X-Multi: a\r\nx-multi: b\r\nX-MULTI: c d\r\nWWW-Authenticate: x\r\n"
+          "Content-Length: 2\r\n\r\n{}");
+    }
+  });
+  const Reply reply = send(session, get(raw.url()));
+  ASSERT_NE(reply.response, nullptr) << reply.error->description();
+  EXPECT_EQ(reply.response->allHeaderFields(),
+            (StringDictionary{{"Content-Length", "2"},
+                              {"Content-Type", "application/json"},
+                              {"Www-Authenticate", "x"},
+                              {"X-Multi", "a, b, c d"},
+                              {"X-Request-Id", "7"}}));
+}
+
+// The limit counts every header line as received, the status line and each
+// CRLF included, up to and including the blank line: a block of exactly the
+// limit is read, one byte more fails.
+TEST_F(URLSessionTest, ResponseHeaderLimitIsExact) {
+  constexpr std::size_t kLimit = 200;
+  const auto head = [](std::size_t size) {
+    std::string text = "HTTP/1.1 200 OK\r\nContent-Length: 2\r\nX-Pad: ";
+    text += std::string(size - text.size() - 4, 'p') + "\r\n\r\n";
+    return text;
+  };
+  std::atomic<std::size_t> size{0};
+  RawServer raw([&](RawConnection& connection) {
+    while (connection.readRequest()) connection.write(head(size) + "hi");
+  });
+  URLSessionConfiguration configuration;
+  configuration.maximumResponseHeaderBytes = kLimit;
+  for (const std::size_t bytes : {kLimit - 1, kLimit, kLimit + 1, kLimit + 2}) {
+    SCOPED_TRACE(std::to_string(bytes) + " bytes of header");
+    ASSERT_EQ(head(bytes).size(), bytes);
+    size = bytes;
+    const Reply reply = send(URLSession::sessionWithConfiguration(configuration), get(raw.url()));
+    if (bytes <= kLimit) {
+      EXPECT_EQ(reply.error, nullptr) << reply.error->description();
+      EXPECT_EQ(reply.body(), "hi");
+    } else {
+      EXPECT_EQ(reply.error ? reply.error->code() : 0, URLErrorBadServerResponse);
+      EXPECT_EQ(reply.response, nullptr);
+    }
+  }
+}
+
 TEST_F(URLSessionTest, EndingATaskOrItsSessionCompletesEachTaskOnce) {
   using End = std::function<void(URLSessionPtr&, URLSessionTask&)>;
   const struct {

@@ -6,9 +6,7 @@
 #include <chrono>
 #include <functional>
 #include <memory>
-#include <optional>
 #include <string>
-#include <string_view>
 #include <thread>
 #include <vector>
 
@@ -25,7 +23,6 @@ using testing::kQuiet;
 using testing::Recorder;
 using testing::Signal;
 using QueuePtr = std::shared_ptr<OperationQueue>;
-using State = KivAsyncOperation::State;
 constexpr auto kPrior = KeyValueObservingOptionPrior;
 
 // Recorded events as "wE dF …": will/did, then R/E/F for isReady/isExecuting/isFinished.
@@ -49,17 +46,6 @@ QueuePtr serialQueue() {
 bool drains(const QueuePtr& queue) {
   return testing::returnsWithin([queue] { queue->waitUntilAllOperationsAreFinished(); }) &&
          queue->operationCount() == 0;
-}
-
-TEST(KivAsyncOperation, RawValuesRoundTripExactly) {
-  const std::pair<State, std::string_view> raw[] = {
-      {State::ready, "Ready"}, {State::executing, "Executing"}, {State::finished, "Finished"}};
-  for (auto [state, text] : raw) {
-    EXPECT_EQ(KivAsyncOperation::rawValue(state), text);
-    EXPECT_EQ(KivAsyncOperation::stateFromRawValue(text), state) << text;
-  }
-  for (std::string_view text : {"ready", "Ready ", " Ready", "", "FINISHED", "executing"})
-    EXPECT_EQ(KivAsyncOperation::stateFromRawValue(text), std::nullopt) << '"' << text << '"';
 }
 
 // What each path announces to an observer of the three state keys, from a new

@@ -3,14 +3,16 @@
 #include <gtest/gtest.h>
 
 #include <cstdint>
+#include <functional>
 #include <map>
 #include <memory>
 #include <string>
 #include <utility>
 #include <vector>
 
-#include "kivi/doubles/mock_kiv_ns_operation_queue.h"
+#include "kivi/base/recursive_lock.h"
 #include "kivi/dispatch/operation_queue.h"
+#include "kivi/doubles/mock_kiv_ns_operation_queue.h"
 #include "operations/async_test_support.h"
 
 namespace kivi {
@@ -27,15 +29,12 @@ void expectRealQueue(const std::shared_ptr<OperationQueueProtocol>& queue, const
   EXPECT_EQ(queue->maxConcurrentOperationCount(), limit);
 }
 
+// The one-argument constructors make a serial queue.
 TEST(KivAsyncServices, MakeTheirQueueWithNameAndLimit) {
   expectRealQueue(KivAsyncServiceObjC("Q").operationQueue(), "Q", 1);
-  const std::pair<const char*, std::int64_t> cases[] = {{"Q", 4}, {"", -1}, {"idle", 0}, {"s", 1}};
-  for (auto [name, limit] : cases) {
-    SCOPED_TRACE(std::string("\"") + name + "\", " + std::to_string(limit));
-    expectRealQueue(KivAsyncServiceObjC(name, limit).operationQueue(), name, limit);
-    expectRealQueue(KivAsyncService(name, limit).operationQueue(), name, limit);
-  }
-  expectRealQueue(KivAtomicWorkflowService("Q").operationQueue(), "Q", 1);
+  expectRealQueue(KivAtomicWorkflowService("W").operationQueue(), "W", 1);
+  expectRealQueue(KivAsyncServiceObjC("", 4).operationQueue(), "", 4);
+  expectRealQueue(KivAsyncService("P", -1).operationQueue(), "P", -1);
 }
 
 class AtomicWorkflowWithMockQueue : public ::testing::Test {
@@ -137,6 +136,114 @@ TEST_F(AtomicWorkflowWithMockQueue, EnumerateAndCancelParkedOperations) {
   EXPECT_EQ(takeHanded(), Names{"A"});
   service_->endAtomicWorkflow();
   EXPECT_EQ(takeHanded(), Names{"B"}) << "a cancelled parked operation still reaches the queue";
+}
+
+// Every entry point is reached through the base class, and the service's own
+// operations go through the subclass's overrides: end() releases through the
+// overridden start(), and the parked list is the one the subclass answers.
+class WorkflowSubclass : public KivAtomicWorkflowService {
+ public:
+  using KivAtomicWorkflowService::KivAtomicWorkflowService;
+  void startAtomicWorkflowWithOperation(const OperationPtr& operation) override {
+    calls.push_back("start " + operation->name());
+    KivAtomicWorkflowService::startAtomicWorkflowWithOperation(operation);
+  }
+  void endAtomicWorkflow() override {
+    calls.push_back("end");
+    KivAtomicWorkflowService::endAtomicWorkflow();
+  }
+  void cancelAllPendingOperations() override {
+    calls.push_back("cancel");
+    KivAtomicWorkflowService::cancelAllPendingOperations();
+  }
+  void enumeratePendingOperationsUsingBlock(
+      const std::function<void(const OperationPtr&, std::uint64_t, bool*)>& block) override {
+    calls.push_back("enumerate");
+    KivAtomicWorkflowService::enumeratePendingOperationsUsingBlock(block);
+  }
+  std::shared_ptr<PendingOperationList> pendingOperations() const override { return parked; }
+
+  Names calls;
+  const std::shared_ptr<PendingOperationList> parked = std::make_shared<PendingOperationList>();
+};
+
+TEST_F(AtomicWorkflowWithMockQueue, SubclassOverridesAreReachedFromTheServiceItself) {
+  auto subclass = std::make_shared<WorkflowSubclass>("sub");
+  subclass->setOperationQueue(queue_);
+  KivAtomicWorkflowService& service = *subclass;
+  for (const char* tag : {"A", "B", "C"}) service.startAtomicWorkflowWithOperation(op(tag));
+  EXPECT_EQ(subclass->parked->size(), 2u);
+  service.cancelAllPendingOperations();
+  service.enumeratePendingOperationsUsingBlock([](const OperationPtr&, std::uint64_t, bool*) {});
+  service.endAtomicWorkflow();
+  EXPECT_EQ(subclass->calls,
+            (Names{"start A", "start B", "start C", "cancel", "enumerate", "end", "start B"}));
+  EXPECT_EQ(takeHanded(), (Names{"A", "B"}));
+  EXPECT_EQ(cancels_, (Names{"B", "C"}));
+  EXPECT_EQ(subclass->parked->size(), 1u);
+}
+
+// Each setter announces its property, the workflow operations included (they
+// set the flag through its setter); valueForKey answers for every property.
+TEST_F(AtomicWorkflowWithMockQueue, SettersAnnounceTheirPropertyToObservers) {
+  const auto recorder = testing::Recorder::watch(
+      *service_,
+      {"operationQueue", "isAtomicWorkflowInProgress", "atomicWorkFlowLock", "pendingOperations"},
+      KeyValueObservingOptionPrior | KeyValueObservingOptionOld | KeyValueObservingOptionNew);
+  using Events = std::vector<testing::Event>;
+  const auto announced = [](const std::string& key, int times = 1) {
+    Events events;
+    for (int i = 0; i < times; ++i) events.insert(events.end(), {{"will", key}, {"did", key}});
+    return events;
+  };
+  const std::string flag = "isAtomicWorkflowInProgress";
+  std::vector<Value> flagValues;  // every "new" value of the flag, in order
+  recorder->onNote = [&](const testing::Note& note) {
+    if (!note.prior && note.key == flag) flagValues.push_back(note.change.at(KeyValueChangeNewKey));
+  };
+
+  auto other = std::make_shared<MockKivNSOperationQueue>();
+  service_->setOperationQueue(other);
+  EXPECT_EQ(recorder->takeEvents(), announced("operationQueue"));
+  EXPECT_EQ(service_->valueForKey("operationQueue"), Value(other));
+  service_->setOperationQueue(queue_);
+  ASSERT_EQ(recorder->count(), 2u);
+  EXPECT_EQ(recorder->changes().back().second.at(KeyValueChangeOldKey), Value(other));
+  EXPECT_EQ(recorder->changes().back().second.at(KeyValueChangeNewKey), Value(queue_));
+  recorder->takeEvents();
+
+  start("A");
+  EXPECT_EQ(recorder->takeEvents(), announced(flag));
+  EXPECT_EQ(service_->valueForKey(flag), Value(true));
+  start("B");
+  EXPECT_EQ(recorder->takeEvents(), Events{}) << "parking sets nothing";
+  service_->endAtomicWorkflow();  // false, then true again for B
+  EXPECT_EQ(recorder->takeEvents(), announced(flag, 2));
+  service_->endAtomicWorkflow();
+  service_->setIsAtomicWorkflowInProgress(false);  // the same value is announced too
+  EXPECT_EQ(recorder->takeEvents(), announced(flag, 2));
+  EXPECT_EQ(flagValues, (std::vector<Value>{Value(true), Value(false), Value(true), Value(false),
+                                            Value(false)}));
+
+  auto lock = std::make_shared<RecursiveLock>();
+  service_->setAtomicWorkFlowLock(lock);
+  service_->setAtomicWorkFlowLock(nullptr);  // refused: nothing to announce
+  EXPECT_EQ(recorder->takeEvents(), announced("atomicWorkFlowLock"));
+  EXPECT_EQ(service_->valueForKey("atomicWorkFlowLock"), Value(lock));
+
+  auto list = std::make_shared<PendingOperationList>(PendingOperationList{op("C"), op("D")});
+  service_->setPendingOperations(list);
+  service_->setPendingOperations(nullptr);
+  EXPECT_EQ(recorder->newValues("pendingOperations"),  // the prior notification carries none
+            (std::vector<Value>{Value(), Value(Array{op("C"), op("D")})}));
+  EXPECT_EQ(recorder->takeEvents(), announced("pendingOperations"));
+  EXPECT_EQ(service_->valueForKey("pendingOperations"), Value(Array{op("C"), op("D")}));
+
+  auto plain = std::make_shared<KivAsyncServiceObjC>("plain");
+  const auto watcher =
+      testing::Recorder::watch(*plain, {"operationQueue"}, KeyValueObservingOptionNew);
+  plain->setOperationQueue(nullptr);
+  EXPECT_EQ(watcher->newValues("operationQueue"), std::vector<Value>{Value()});
 }
 
 // With the real queue, parked operations stay out of it until end() releases

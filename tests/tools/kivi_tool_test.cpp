@@ -2,10 +2,14 @@
 // code, and what lands on standard output and standard error.
 #include <sys/wait.h>
 
+#include <algorithm>
 #include <cstdio>
 #include <cstdlib>
 #include <fstream>
 #include <sstream>
+#include <string>
+#include <utility>
+#include <vector>
 
 #include "test_servers.h"
 
@@ -31,11 +35,14 @@ std::string slurp(const std::string& path) {
   return text.str();
 }
 
-ToolRun kivi(const std::vector<std::string>& args, const std::string& input = "") {
+// Runs the tool; one that is still running after `deadline` seconds is
+// killed and reported with exit code 124.
+ToolRun kivi(const std::vector<std::string>& args, const std::string& input = "",
+             int deadline = 20) {
   // ctest runs test cases as parallel processes: one set of files each.
   const std::string base = ::testing::TempDir() + "kivi_" + std::to_string(::getpid()) + "_";
   std::ofstream(base + "in") << input;
-  std::string command = quoted(KIVI_TOOL_PATH);
+  std::string command = "timeout -k 5 " + std::to_string(deadline) + " " + quoted(KIVI_TOOL_PATH);
   for (const auto& arg : args) command += " " + quoted(arg);
   command += " <" + base + "in >" + base + "out 2>" + base + "err";
   const int status = std::system(command.c_str());
@@ -63,6 +70,14 @@ TEST(KiviToolTest, GetClassifiesEachAnswerAndExitsWithItsStatus) {
       {{"get", server.url("/status/403")},
        6,
        "status: KivJSONAPIOperationCompletionStatusAccessDenied\n",
+       ""},
+      {{"get", server.url("/status/299")},
+       0,
+       "status: KivJSONAPIOperationCompletionStatusSuccess\nhttp: 299\n",
+       ""},
+      {{"get", server.url("/status/300")},
+       8,
+       "status: KivJSONAPIOperationCompletionStatusInvalidServerResponse\nhttp: 300\n",
        ""},
       {{"get", server.url("/status/500")},
        8,
@@ -152,16 +167,80 @@ TEST(KiviToolTest, TextCommands) {
       {{"redact", "headers"}, "X-B: 2\nAuthorization: t\n", 0, "Authorization: ***\nX-B: 2\n"},
       {{"redact", "keep", "X-B"}, "X-B: 2\nX-A: 1\n", 0, "X-A: ***\nX-B: 2\n"},
       {{"redact", "headers"}, "no colon\n", 2, ""},
+      // CRLF line ends, as copied from a wire trace: no value keeps the CR.
+      {{"redact", "headers"},
+       "X-B: 2\r\nAuthorization: t\r\n\r\n",
+       0,
+       "Authorization: ***\nX-B: 2\n"},
+      {{"redact", "keep", "X-B"}, "X-B: 1\r\nX-A: 1\r\nX-B: 2\r\n", 0, "X-A: ***\nX-B: 1, 2\n"},
+      {{"redact", "headers", "--url", "https://d/"},
+       "Set-Cookie: a=1\r\nset-cookie: b=2\r\n",
+       0,
+       "Set-Cookie: a=***, path=/, domain=d;\nset-cookie: b=2\n"},
+      {{"ulo", "get", "-", "B"}, "A=1\r\nB=2\r\n", 0, "2\n"},
+      {{"ulo", "get", "-", "C"}, "A=1\r\nB=2\r\n", 1, ""},
+      {{"ulo", "get", "-", "A"}, "A=\xff\n", 2, ""},
+      {{"ulo", "get", "-"}, "A=1\n", 2, ""},
+      {{"ulo", "bool", "-", "Flag", "on"}, "Flag=ON\r\n", 0, "true\n"},
+      {{"ulo", "bool", "-", "Missing", "on"}, "Flag=ON\r\n", 0, "false\n"},
       {{"obfuscate", "Hello"}, "", 0, "BZ\\WU\n"},
       {{"unobfuscate", "BZ\\WU"}, "", 0, "Hello\n"},
       {{"nosuchcommand"}, "", 2, ""},
       {{}, "", 2, ""},
   };
   for (const auto& row : rows) {
+    std::string call = "kivi";
+    for (const auto& arg : row.args) call += " " + arg;
+    SCOPED_TRACE(call + " < " + ::testing::PrintToString(row.input));
     const ToolRun run = kivi(row.args, row.input);
-    EXPECT_EQ(run.exit, row.exit) << (row.args.empty() ? "" : row.args[0]) << "\n" << run.err;
+    EXPECT_EQ(run.exit, row.exit) << run.err;
     EXPECT_EQ(run.out, row.out) << run.err;
   }
+}
+
+// The demo must finish on its own and show what its help promises: every
+// transition, the parked workflows released in order, and one status line per
+// REST call.
+TEST(KiviToolTest, DemoFinishesAndShowsTransitionsAndEveryRestStatus) {
+  const ToolRun run = kivi({"demo"}, "", 40);
+  ASSERT_EQ(run.exit, 0) << (run.exit == 124 ? "kivi demo hung\n" : "") << run.out << run.err;
+  EXPECT_EQ(run.err, "");
+  // Journal lines: the label padded to 13 columns, then the text.
+  const auto line = [](std::string who, const std::string& what) {
+    who.resize(std::max<std::size_t>(who.size(), 13), ' ');
+    return "] " + who + what;
+  };
+  std::vector<std::string> expected;
+  for (const char* who :
+       {"workflow-1", "workflow-2", "workflow-3", "workflow-4", "job-1", "job-2", "job-3", "job-4",
+        "gated", "profile", "session", "admin", "status.txt", "broken", "slow"}) {
+    expected.push_back(line(who, "Ready -> Executing"));
+    expected.push_back(line(who, "Executing -> Finished"));
+  }
+  for (const auto& [who, what] : std::vector<std::pair<std::string, std::string>>{
+           {"workflow-5", "Ready -> Finished (cancelled before it began)"},
+           {"gated", "held back: isReady false"},
+           {"gated", "gate open: isReady true"},
+           {"profile", "status Success (http 200)"},
+           {"session", "status Unauthorized (http 401)"},
+           {"admin", "status AccessDenied (http 403)"},
+           {"status.txt", "status InvalidContentType (http 200)"},
+           {"broken", "status InvalidServerResponse (http 200)"},
+           {"slow", "status Cancelled"}}) {
+    expected.push_back(line(who, what));
+  }
+  expected.push_back(
+      "Parked workflows were released in this order: workflow-2 workflow-3 workflow-4 "
+      "workflow-5\n");
+  for (const std::string& text : expected)
+    EXPECT_NE(run.out.find(text), std::string::npos) << text << " not in\n" << run.out;
+  const std::string most = "Most operations executing at once: ";
+  const auto at = run.out.find(most);
+  ASSERT_NE(at, std::string::npos) << run.out;
+  EXPECT_TRUE(run.out.compare(at + most.size(), 2, "1 ") == 0 ||
+              run.out.compare(at + most.size(), 2, "2 ") == 0)
+      << "more than the service's limit of 2 ran at once:\n"
+      << run.out;
 }
 
 }  // namespace

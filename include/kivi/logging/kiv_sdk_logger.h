@@ -17,9 +17,11 @@
 // announces in optionalMethods(); other lines are dropped, never rerouted.
 // Any other level is ignored. Bad input is absorbed: a null module becomes
 // "<unknown>", a null or non-UTF-8 file or function name "<unknown>", a null
-// format string the message "" (the arguments are not looked at). A line is
-// formatted only when it will be delivered, so a logger without a delegate
-// costs a few loads per call.
+// format string the message "" (the arguments are not looked at). Every line
+// is built (names checked, message formatted) before the level and the
+// delegate are looked at: a line that is then dropped, for want of a
+// delegate or of a method for its level, has still been formatted, and the
+// descriptions of its %@ arguments have run.
 //
 // Thread contract: every member may be called from any thread, also while
 // another thread replaces the delegate. A log call reads the delegate once and
@@ -42,9 +44,9 @@
 #include <string>
 #include <string_view>
 
-#include "kivi/text/format.h"
 #include "kivi/base/object.h"
 #include "kivi/logging/kiv_sdk_logger_delegate.h"
+#include "kivi/text/format.h"
 
 namespace kivi {
 

@@ -29,10 +29,10 @@
 #include <string>
 #include <vector>
 
+#include "kivi/base/value.h"
 #include "kivi/net/http_url_response.h"
 #include "kivi/net/url.h"
 #include "kivi/net/url_request.h"
-#include "kivi/base/value.h"
 
 namespace kivi {
 
@@ -51,20 +51,20 @@ std::string KivSdkTokenForLogging(const std::optional<std::string>& token);
 inline std::string KivSdkTokenForLogging(std::nullptr_t) { return "nil"; }
 
 // A copy of `headers` in which the value under "Authorization" is masked
-// and, when `url` is given and the "Set-Cookie" fields (read in any letter
-// case) set at least one cookie for it, the value under "Set-Cookie" becomes
-// the list of those cookies, each written "name=<masked value>, path=<path>,
-// domain=<domain>;" with nothing in between. Only these two exact names are
-// changed: a field spelt "authorization" or "set-cookie" keeps its value.
+// and, when `url` is given and the value under "Set-Cookie" sets at least one
+// cookie for it, that value becomes the list of those cookies, each written
+// "name=<masked value>, path=<path>, domain=<domain>;" with nothing in
+// between. Only these two exact names are read and changed: a field spelt
+// "authorization" or "set-cookie" keeps its value and adds no cookie.
 // URLSession's answers spell names canonically; for dictionaries from
 // elsewhere, the allow-list form is the safe one.
 // A null or empty `headers` is returned itself (the very same pointer).
 HeaderDictionaryPtr KivSdkResponseHeadersForLogging(const HeaderDictionaryPtr& headers,
                                                     const URLPtr& url);
 // The same for a Value. One that is not a dictionary, or an empty one, comes
-// back as it is (sharing its dictionary). Only string values take part in
-// cookie parsing; an "Authorization" value of another kind becomes "***",
-// other values of any kind pass through.
+// back as it is (sharing its dictionary). A "Set-Cookie" value that is not a
+// string is left as it is; an "Authorization" value of another kind becomes
+// "***", other values of any kind pass through.
 Value KivSdkResponseHeadersForLogging(const Value& headers, const URLPtr& url);
 inline HeaderDictionaryPtr KivSdkResponseHeadersForLogging(std::nullptr_t, const URLPtr&) {
   return nullptr;

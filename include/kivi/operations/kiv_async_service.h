@@ -2,8 +2,8 @@
 // Each owns one operation queue, held through OperationQueueProtocol so that a
 // host can put a double in its place.
 //
-//   KivAsyncServiceObjC     observable; the one-argument constructor gives a
-//                           serial queue (limit 1)
+//   KivAsyncServiceObjC     observable (see below); the one-argument
+//                           constructor gives a serial queue (limit 1)
 //   KivAsyncService         plain; the caller always chooses the limit
 //   KivAtomicWorkflowService  serial; runs one atomic workflow at a time
 //
@@ -19,6 +19,19 @@
 //   });
 //   service->startAtomicWorkflowWithOperation(op);
 //
+// Observable: every setter of KivAsyncServiceObjC and KivAtomicWorkflowService
+// announces its change with willChangeValueForKey / didChangeValueForKey under
+// the property's name ("operationQueue", "isAtomicWorkflowInProgress",
+// "atomicWorkFlowLock", "pendingOperations"), also when the value stays the
+// same, and valueForKey answers for each (a queue that is no Object, and a
+// missing one, read as the null marker; the pending list as an Array copy).
+// The workflow operations set the flag through its setter, so observers of
+// "isAtomicWorkflowInProgress" see every start and end, on the calling thread
+// with the lock held. The workflow operations and every accessor are virtual
+// and read and write the fields only through the accessors: a subclass may
+// override any of them, and endAtomicWorkflow() hands a released operation to
+// the subclass's startAtomicWorkflowWithOperation().
+//
 // Thread contract: the workflow operations may be called from any thread; all
 // four hold atomicWorkFlowLock (a recursive lock) for their whole length,
 // including the call into the queue and the whole enumeration. An enumeration
@@ -33,10 +46,11 @@
 #include <functional>
 #include <memory>
 #include <string>
+#include <string_view>
 
 #include "kivi/base/object.h"
-#include "kivi/dispatch/operation.h"
 #include "kivi/base/recursive_lock.h"
+#include "kivi/dispatch/operation.h"
 #include "kivi/dispatch/operation_queue_protocol.h"
 
 namespace kivi {
@@ -50,7 +64,10 @@ class KivAsyncServiceObjC : public Object {
   KivAsyncServiceObjC(std::string operationQueueName, std::int64_t maxConcurrentOperationCount);
 
   virtual std::shared_ptr<OperationQueueProtocol> operationQueue() const;
+  // Announces "operationQueue".
   virtual void setOperationQueue(std::shared_ptr<OperationQueueProtocol> operationQueue);
+
+  Value valueForKey(std::string_view key) const override;
 
  private:
   std::shared_ptr<OperationQueueProtocol> operationQueue_;
@@ -78,26 +95,30 @@ class KivAtomicWorkflowService : public KivAsyncServiceObjC {
 
   // Idle: hands `operation` to the queue and becomes Busy. Busy: parks it.
   // A null operation is refused; nothing changes.
-  void startAtomicWorkflowWithOperation(const OperationPtr& operation);
-  // Becomes Idle, then releases the oldest parked operation, if any (which
-  // makes the service Busy again).
-  void endAtomicWorkflow();
+  virtual void startAtomicWorkflowWithOperation(const OperationPtr& operation);
+  // Becomes Idle, then releases the oldest parked operation, if any, through
+  // startAtomicWorkflowWithOperation() (which makes the service Busy again).
+  virtual void endAtomicWorkflow();
   // Cancels every parked operation, oldest first; they stay parked.
-  void cancelAllPendingOperations();
+  virtual void cancelAllPendingOperations();
   // Calls `block` with each parked operation and its index, oldest first,
   // until it sets *stop to true.
-  void enumeratePendingOperationsUsingBlock(
+  virtual void enumeratePendingOperationsUsingBlock(
       const std::function<void(const OperationPtr& operation, std::uint64_t index, bool* stop)>&
           block);
 
   virtual bool isAtomicWorkflowInProgress() const;
+  // Announces "isAtomicWorkflowInProgress".
   virtual void setIsAtomicWorkflowInProgress(bool inProgress);
   virtual std::shared_ptr<RecursiveLock> atomicWorkFlowLock() const;
-  // A null lock is refused.
+  // Announces "atomicWorkFlowLock". A null lock is refused (nothing changes,
+  // nothing is announced).
   virtual void setAtomicWorkFlowLock(std::shared_ptr<RecursiveLock> lock);
   virtual std::shared_ptr<PendingOperationList> pendingOperations() const;
-  // A null list is refused.
+  // Announces "pendingOperations". A null list is refused.
   virtual void setPendingOperations(std::shared_ptr<PendingOperationList> pendingOperations);
+
+  Value valueForKey(std::string_view key) const override;
 
  private:
   std::atomic<bool> isAtomicWorkflowInProgress_{false};
