@@ -130,9 +130,11 @@ class RawConnection {
     buffer_.erase(0, end);
     return request;
   }
-  void write(std::string_view bytes) {
+  // False once the peer has gone (or kServerWait passed on a full socket).
+  bool write(std::string_view bytes) {
     for (ssize_t n = 0; fd_ >= 0 && !bytes.empty(); bytes.remove_prefix(std::size_t(n)))
-      if ((n = ::send(fd_, bytes.data(), bytes.size(), MSG_NOSIGNAL)) <= 0) return;
+      if ((n = ::send(fd_, bytes.data(), bytes.size(), MSG_NOSIGNAL)) <= 0) return false;
+    return fd_ >= 0;
   }
   void reset() {  // closes with RST instead of FIN
     const linger abort{1, 0};
