@@ -40,9 +40,10 @@
 #include <thread>
 #include <vector>
 
+#include "kivi/dispatch/operation_queue_protocol.h"
 #include "kivi/operations/kiv_async_operation.h"
 #include "kivi/operations/kiv_async_service.h"
-#include "kivi/dispatch/operation_queue_protocol.h"
+#include "minimal_pool.h"
 
 namespace kivi {
 namespace {
@@ -94,57 +95,7 @@ void BM_KivAsyncServiceObjC(benchmark::State& state) {
                                                                                      service);
 }
 
-// The baseline: the least a thread pool needs to run the same work.
-class MinimalPool {
- public:
-  explicit MinimalPool(int threadCount) {
-    workers_.reserve(static_cast<std::size_t>(threadCount));
-    for (int i = 0; i < threadCount; ++i) {
-      workers_.emplace_back([this] { workerLoop(); });
-    }
-  }
-
-  ~MinimalPool() {
-    {
-      std::lock_guard lock(mutex_);
-      stopping_ = true;
-    }
-    cv_.notify_all();
-    for (auto& worker : workers_) worker.join();
-  }
-
-  MinimalPool(const MinimalPool&) = delete;
-  MinimalPool& operator=(const MinimalPool&) = delete;
-
-  void submit(std::function<void()> task) {
-    {
-      std::lock_guard lock(mutex_);
-      tasks_.push_back(std::move(task));
-    }
-    cv_.notify_one();
-  }
-
- private:
-  void workerLoop() {
-    for (;;) {
-      std::function<void()> task;
-      {
-        std::unique_lock lock(mutex_);
-        cv_.wait(lock, [this] { return stopping_ || !tasks_.empty(); });
-        if (tasks_.empty()) return;
-        task = std::move(tasks_.front());
-        tasks_.pop_front();
-      }
-      task();
-    }
-  }
-
-  std::mutex mutex_;
-  std::condition_variable cv_;
-  std::deque<std::function<void()>> tasks_;
-  bool stopping_ = false;
-  std::vector<std::thread> workers_;
-};
+using bench::MinimalPool;
 
 // The pool-side counterpart of a trivial operation.
 struct PoolTask {

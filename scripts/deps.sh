@@ -8,6 +8,8 @@ set -euo pipefail
 
 # Everything the build, the tests, the benchmarks and the fuzzers need.
 #   libclang-rt-14-dev: libFuzzer and the sanitizer runtimes for clang.
+#   nginx, openssl: a real HTTPS and HTTP/2 server for the network tests,
+#   started by the tests themselves on 127.0.0.1 (never as a service).
 PACKAGES=(
   cmake
   ninja-build
@@ -25,6 +27,8 @@ PACKAGES=(
   libsimdjson-dev
   nlohmann-json3-dev
   libcpp-httplib-dev
+  nginx
+  openssl
 )
 
 # Prints the packages among the arguments that are not installed.
@@ -52,7 +56,19 @@ fi
 
 echo "deps.sh: installing ${missing[*]}" >&2
 apt-get update
-DEBIAN_FRONTEND=noninteractive apt-get install -y --no-install-recommends "${missing[@]}"
+# Packages that bring a service (nginx) must not start it: the tests start
+# their own server when they need one.
+policy=/usr/sbin/policy-rc.d
+own_policy=0
+if [[ ! -e $policy ]]; then
+  printf '#!/bin/sh\nexit 101\n' >"$policy"
+  chmod +x "$policy"
+  own_policy=1
+fi
+status=0
+DEBIAN_FRONTEND=noninteractive apt-get install -y --no-install-recommends "${missing[@]}" || status=$?
+if ((own_policy)); then rm -f "$policy"; fi
+((status == 0)) || exit "$status"
 
 mapfile -t still_missing < <(missing_packages "${missing[@]}")
 if ((${#still_missing[@]} > 0)); then

@@ -6,6 +6,7 @@
 #include <algorithm>
 #include <chrono>
 #include <cstdint>
+#include <cstdlib>
 #include <mutex>
 #include <unordered_map>
 #include <vector>
@@ -206,6 +207,13 @@ struct Ended {
   std::int64_t code = 0;
 };
 
+namespace {
+std::string environment(const char* name) {
+  const char* value = std::getenv(name);
+  return value ? value : "";
+}
+}  // namespace
+
 struct URLSessionTask::Impl {
   std::mutex mutex;
   // The session's state, until the task has completed. Guarded by mutex.
@@ -228,6 +236,9 @@ struct URLSessionCore : std::enable_shared_from_this<URLSessionCore> {
 
   const URLSessionConfiguration configuration;
   const std::shared_ptr<OperationQueue> delegateQueue;
+  // Where OpenSSL's own variables put the trusted certificates, if they do.
+  const std::string trustedFile = environment("SSL_CERT_FILE");
+  const std::string trustedDirectory = environment("SSL_CERT_DIR");
 
   // Guards everything below. Every call into `multi` is made holding it, so
   // libcurl's callbacks run under it too.
@@ -440,6 +451,8 @@ bool URLSessionCore::configure(Transfer& t) {
   curl_easy_setopt(easy, CURLOPT_PROTOCOLS_STR, "http,https");
   curl_easy_setopt(easy, CURLOPT_REDIR_PROTOCOLS_STR, "http,https");
   curl_easy_setopt(easy, CURLOPT_HTTP_VERSION, CURL_HTTP_VERSION_2TLS);
+  if (!trustedFile.empty()) curl_easy_setopt(easy, CURLOPT_CAINFO, trustedFile.c_str());
+  if (!trustedDirectory.empty()) curl_easy_setopt(easy, CURLOPT_CAPATH, trustedDirectory.c_str());
   // Wait for a connection that is being set up, in case it turns out to
   // multiplex, rather than open another one to the same host.
   curl_easy_setopt(easy, CURLOPT_PIPEWAIT, 1L);

@@ -5,7 +5,9 @@
 // connection is closed after 90 seconds without use, or when the server
 // closes it), HTTP/2 is used over TLS where the server offers it and
 // concurrent requests to one host then share one connection, certificates are
-// checked against the system's store, redirects are followed (at most 16),
+// checked against the system's store (or the file and directory that
+// OpenSSL's SSL_CERT_FILE and SSL_CERT_DIR name, read when the session is
+// made), redirects are followed (at most 16),
 // and gzip, deflate and brotli answers are decoded. resume() sends the
 // request on the calling thread as far as the socket takes it; the library's
 // event thread then waits for the answer and for deadlines. Each task's
