@@ -6,7 +6,7 @@ Run the benchmarks with repetitions and interleaving, then name the pairs:
   build-release/bench/kivi_bench --benchmark_filter='Jobs|Sleepers' \\
       --benchmark_repetitions=5 --benchmark_enable_random_interleaving=true \\
       --benchmark_format=json > run.json
-  scripts/bench_ratios.py run.json BM_SerialQueueJobs:BM_MinimalPoolJobs/threads:2
+  scripts/bench_ratios.py run.json BM_SerialQueueJobs,BM_MinimalPoolJobs/threads:2
 
 Each pair prints numerator / denominator of the median wall time and of the
 median CPU time (the report's own median aggregate when it has one, else the
@@ -41,7 +41,7 @@ def main(argv):
     for name, (real, cpu, unit) in sorted(table.items()):
         print(f"{name:60} wall {real:12.3f} {unit}   cpu {cpu:12.3f} {unit}")
     for pair in argv[2:]:
-        num, den = pair.split(":", 1)
+        num, den = pair.split(",", 1)
         if num not in table or den not in table:
             print(f"{pair}: not in the report")
             continue

@@ -1,11 +1,10 @@
 #include "kivi/dispatch/dispatch_queue.h"
 
-#include <algorithm>
 #include <atomic>
 #include <deque>
 #include <mutex>
-#include <vector>
 
+#include "kivi/dispatch/detail/current_queue.h"
 #include "kivi/dispatch/worker_pool.h"
 
 namespace kivi {
@@ -15,16 +14,7 @@ namespace {
 // Items a drain job runs before it lets other work of the pool go first.
 constexpr int kDrainBatch = 256;
 
-// The queues whose work the calling thread is running, innermost last.
-thread_local std::vector<const void*> tRunning;
-
-class RunningScope {
- public:
-  explicit RunningScope(const void* queue) { tRunning.push_back(queue); }
-  ~RunningScope() { tRunning.pop_back(); }
-  RunningScope(const RunningScope&) = delete;
-  RunningScope& operator=(const RunningScope&) = delete;
-};
+using RunningScope = detail::CurrentQueueScope;
 
 // Passes a serial queue to a thread waiting in sync(). Shared, so that the
 // thread that sets it never touches memory the waiter has already left.
@@ -109,16 +99,17 @@ const std::string& DispatchQueue::label() const noexcept { return core_->label; 
 bool DispatchQueue::isSerial() const noexcept { return core_->serial; }
 
 bool DispatchQueue::isCurrent() const noexcept {
-  return std::find(tRunning.begin(), tRunning.end(), core_.get()) != tRunning.end();
+  return detail::CurrentQueueScope::contains(core_.get());
 }
 
 void DispatchQueue::async(std::function<void()> work) {
   Core& core = *core_;
   if (!core.serial) {
-    WorkerPool::shared().submit([core = core_, work = std::move(work)] {
-      RunningScope running(core.get());
-      work();
-    });
+    // The global queue lives as long as the process; any other is kept alive
+    // by its work.
+    const bool immortal = this == global().get();
+    WorkerPool::shared().submit(std::move(work), core_.get(),
+                                immortal ? nullptr : std::shared_ptr<const void>(core_));
     return;
   }
   bool schedule = false;

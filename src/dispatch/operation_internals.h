@@ -17,7 +17,17 @@
 
 namespace kivi::detail {
 
-struct QueueEntry;
+// A queue's record of one of its operations, in its pending or running
+// list. It lives in the operation's own state, so queueing allocates nothing.
+struct QueueEntry {
+  OperationPtr operation;  // the queue's reference
+  QueueEntry* previous = nullptr;
+  QueueEntry* next = nullptr;
+  std::uint64_t sequence = 0;    // add order
+  std::uint64_t readyEpoch = 0;  // of the readiness last read
+  bool ready = false;            // readiness last read
+  bool started = false;          // in the running list
+};
 
 struct OperationState {
   mutable std::mutex mutex;
@@ -43,21 +53,10 @@ struct OperationState {
   std::atomic<std::size_t> dependencyCount{0};  // dependencies.size()
   std::atomic<std::uint64_t> readyEpoch{0};
 
-  // The queue's entry while the operation is in a queue; guarded by that
-  // queue's mutex.
+  // The queue's entry: `entry` points to `queueEntry` while the operation is
+  // in a queue. Both guarded by that queue's mutex.
+  QueueEntry queueEntry;
   QueueEntry* entry = nullptr;
-};
-
-// The queue's record of one of its operations, in its pending or running
-// list.
-struct QueueEntry {
-  OperationPtr operation;  // the queue's reference
-  QueueEntry* previous = nullptr;
-  QueueEntry* next = nullptr;
-  std::uint64_t sequence = 0;    // add order
-  std::uint64_t readyEpoch = 0;  // of the readiness last read
-  bool ready = false;            // readiness last read
-  bool started = false;          // in the running list
 };
 
 // A list of entries linked through themselves. Guarded by the core's mutex.

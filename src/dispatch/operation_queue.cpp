@@ -37,12 +37,12 @@ void EntryList::remove(QueueEntry* entry) {
 
 QueueCore::~QueueCore() {
   // Only reached with both lists empty (keepAlive holds the core while it has
-  // operations), but entries must never outlive it.
+  // operations), but no operation may be left pointing at it.
   for (EntryList* list : {&pending, &running}) {
     while (QueueEntry* entry = list->front()) {
       list->remove(entry);
-      stateOf(*entry->operation).entry = nullptr;
-      delete entry;
+      OperationPtr operation = std::move(entry->operation);
+      stateOf(*operation).entry = nullptr;
     }
   }
 }
@@ -69,7 +69,8 @@ bool QueueCore::add(const OperationPtr& operation) {
     // Finished meanwhile (started by hand): its finish found no entry and
     // was delivered; there is nothing to list.
     if (state.finishHandled.load(std::memory_order_acquire)) return true;
-    auto* entry = new QueueEntry;
+    QueueEntry* entry = &state.queueEntry;
+    *entry = QueueEntry{};
     entry->operation = operation;
     entry->sequence = nextSequence++;
     entry->ready = ready;
@@ -139,7 +140,6 @@ std::size_t QueueCore::retireLocked(Operation& operation, Retired& retired) {
     if (entry->ready) --readyPending;
   }
   retired.held = std::move(entry->operation);
-  delete entry;
   const bool empty = pending.empty() && running.empty();
   if (empty) retired.keeper = std::move(keepAlive);
   if (batchWaiters || (emptyWaiters && empty)) left.notify_all();

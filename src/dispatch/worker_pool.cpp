@@ -10,13 +10,13 @@
 #include <condition_variable>
 #include <cstdint>
 #include <cstdio>
-#include <deque>
 #include <memory>
 #include <mutex>
 #include <string_view>
 #include <thread>
 #include <vector>
 
+#include "kivi/dispatch/detail/current_queue.h"
 #include "kivi/dispatch/detail/thread_start.h"
 
 namespace kivi {
@@ -62,6 +62,7 @@ struct WorkerRecord {
   std::uint64_t jobsTaken = 0;
   bool busy = false;
   bool blocked = false;
+  bool stuck = false;  // the monitor found it off the processor in a long job
   // The monitor's own notes, touched only by the monitor thread.
   std::uint64_t jobsSeen = UINT64_MAX;
   int stuckIntervals = 0;  // > 0 while judged stuck in its current job
@@ -69,6 +70,54 @@ struct WorkerRecord {
 
 thread_local WorkerRecord* tWorker = nullptr;
 thread_local int tBlockingDepth = 0;
+// The queues whose work this thread runs, innermost last; a small fixed
+// stack, since sync() onto a queue from another queue's work nests.
+thread_local const void* tQueues[16];
+thread_local int tQueueDepth = 0;
+
+struct Job {
+  std::function<void()> work;
+  const void* queue = nullptr;
+  std::shared_ptr<const void> keepAlive;
+};
+
+// First in, first out, in one ring that grows with the backlog and shrinks
+// again once the backlog has gone: adding and taking jobs allocates nothing
+// in between.
+class JobRing {
+ public:
+  bool empty() const { return size_ == 0; }
+  std::size_t size() const { return size_; }
+  void push(Job job) {
+    if (size_ == slots_.size()) grow();
+    slots_[(head_ + size_) & (slots_.size() - 1)] = std::move(job);
+    ++size_;
+  }
+  Job pop() {
+    Job job = std::move(slots_[head_]);
+    head_ = (head_ + 1) & (slots_.size() - 1);
+    --size_;
+    if (slots_.size() > kKept && size_ < slots_.size() / 8) resize(slots_.size() / 4);
+    return job;
+  }
+
+ private:
+  static constexpr std::size_t kKept = 1024;  // slots never given back
+
+  void grow() { resize(std::max<std::size_t>(64, slots_.size() * 2)); }
+
+  void resize(std::size_t capacity) {
+    std::vector<Job> slots(capacity);
+    for (std::size_t i = 0; i < size_; ++i) {
+      slots[i] = std::move(slots_[(head_ + i) & (slots_.size() - 1)]);
+    }
+    slots_ = std::move(slots);
+    head_ = 0;
+  }
+  std::vector<Job> slots_;  // a power of two long
+  std::size_t head_ = 0;
+  std::size_t size_ = 0;
+};
 
 // Whether the thread is neither running nor waiting for a processor
 // (/proc/self/task/<tid>/stat, the field after the command name).
@@ -92,11 +141,13 @@ bool isOffProcessor(pid_t tid) {
 struct WorkerPool::State {
   std::mutex mutex;
   std::condition_variable wake;  // idle workers wait here
-  std::deque<std::function<void()>> jobs;
+  JobRing jobs;
   std::vector<std::shared_ptr<WorkerRecord>> workers;
-  std::size_t threads = 0;  // counts workers being started
-  std::size_t idle = 0;
-  std::size_t blocked = 0;
+  std::size_t threads = 0;   // counts workers being started
+  std::size_t idle = 0;      // waiting for work
+  std::size_t signaled = 0;  // of the idle, woken and not up yet
+  std::size_t blocked = 0;   // inside a blocking call or BlockingScope
+  std::size_t stuck = 0;     // busy, but the monitor found them stuck
   std::size_t width = 2;
   std::condition_variable monitorWake;
   bool monitorArmed = false;
@@ -104,7 +155,22 @@ struct WorkerPool::State {
 
   using Starts = std::vector<std::shared_ptr<WorkerRecord>>;
 
-  std::size_t runningLocked() const { return threads - idle - blocked; }
+  // Workers running, about to run, or being started.
+  std::size_t runningLocked() const { return threads - (idle - signaled) - blocked - stuck; }
+
+  // Under mutex: wakes an idle worker (true) if one is left unclaimed.
+  bool claimIdleLocked() {
+    if (idle == signaled) return false;
+    ++signaled;
+    return true;
+  }
+
+  // Under mutex: the worker is no longer in the job the monitor judged.
+  void unstickLocked(WorkerRecord& record) {
+    if (!record.stuck) return;
+    record.stuck = false;
+    --stuck;
+  }
 
   // Under mutex: books up to `count` new workers; start them after unlocking.
   Starts bookWorkersLocked(std::size_t count) {
@@ -160,37 +226,48 @@ struct WorkerPool::State {
     std::unique_lock lock(mutex);
     record->tid = tid;
     for (;;) {
+      unstickLocked(*record);
       while (jobs.empty()) {
         record->busy = false;
         ++idle;
-        const bool woke = wake.wait_for(lock, kIdleTimeout, [&] { return !jobs.empty(); });
+        const bool timedOut = wake.wait_for(lock, kIdleTimeout) == std::cv_status::timeout;
         --idle;
-        if (!woke && threads > width) {
+        if (signaled > 0) --signaled;  // any wake-up uses up a claim
+        if (jobs.empty() && timedOut && threads > width) {
           --threads;
           std::erase(workers, record);
           tWorker = nullptr;
           return;
         }
       }
-      auto job = std::move(jobs.front());
-      jobs.pop_front();
+      Job job = jobs.pop();
       record->busy = true;
       ++record->jobsTaken;
       lock.unlock();
-      job();
-      job = nullptr;  // release captures outside the lock
+      if (job.queue) {
+        detail::CurrentQueueScope current(job.queue);
+        job.work();
+      } else {
+        job.work();
+      }
+      job = {};  // release captures outside the lock
       lock.lock();
     }
   }
 
   void enterBlocking() {
     Starts starts;
+    bool wakeOne = false;
     {
       std::lock_guard lock(mutex);
       ++blocked;
       tWorker->blocked = true;
-      if (jobs.size() > idle && runningLocked() < width) starts = bookWorkersLocked(1);
+      if (!jobs.empty() && runningLocked() < width) {
+        wakeOne = claimIdleLocked();
+        if (!wakeOne) starts = bookWorkersLocked(1);
+      }
     }
+    if (wakeOne) wake.notify_one();
     startWorkers(starts);
   }
 
@@ -217,17 +294,15 @@ struct WorkerPool::State {
         monitorArmed = false;
         continue;
       }
-      std::size_t starting = 0;
       looks.clear();
       for (const auto& record : workers) {
-        if (record->tid == 0) {
-          ++starting;
-        } else if (record->busy && !record->blocked) {
+        if (record->tid != 0 && record->busy && !record->blocked) {
           looks.push_back({record, record->tid, record->jobsTaken});
         }
       }
       lock.unlock();
-      std::size_t stuck = 0;
+      // Judged outside the lock: reading /proc takes system calls.
+      std::vector<WorkerRecord*> foundStuck, foundRunning;
       for (auto& look : looks) {
         WorkerRecord& w = *look.record;
         if (look.jobsTaken != w.jobsSeen) {  // it has moved on since the last look
@@ -235,26 +310,44 @@ struct WorkerPool::State {
           w.stuckIntervals = 0;
           continue;
         }
-        if (w.stuckIntervals > 0 && w.stuckIntervals++ % kRecheckIntervals != 0) {
-          ++stuck;
-          continue;
-        }
+        if (w.stuckIntervals > 0 && w.stuckIntervals++ % kRecheckIntervals != 0) continue;
         if (isOffProcessor(look.tid)) {
           w.stuckIntervals = std::max(w.stuckIntervals, 1);
-          ++stuck;
+          foundStuck.push_back(&w);
         } else {
           w.stuckIntervals = 0;
+          foundRunning.push_back(&w);
         }
       }
-      const std::size_t running = looks.size() - stuck + starting;
-      looks.clear();  // drop the references outside the lock
       lock.lock();
-      Starts starts;
-      if (idle > 0) {
-        wake.notify_all();
-      } else if (running < width) {
-        starts = bookWorkersLocked(std::min(width - running, jobs.size()));
+      for (std::size_t i = 0; i < looks.size(); ++i) {
+        WorkerRecord& w = *looks[i].record;
+        // Only a worker still in the job it was judged in.
+        if (!w.busy || w.blocked || w.jobsTaken != looks[i].jobsTaken) continue;
+        const bool isStuck =
+            std::find(foundStuck.begin(), foundStuck.end(), &w) != foundStuck.end();
+        const bool isRunning =
+            std::find(foundRunning.begin(), foundRunning.end(), &w) != foundRunning.end();
+        if (isStuck && !w.stuck) {
+          w.stuck = true;
+          ++stuck;
+        } else if (isRunning) {
+          unstickLocked(w);
+        }
       }
+      looks.clear();  // the records stay alive: the pool holds them while their threads run
+      Starts starts;
+      std::size_t wakes = 0;
+      while (jobs.size() > wakes + starts.size() && runningLocked() < width) {
+        if (claimIdleLocked()) {
+          ++wakes;
+        } else {
+          auto more = bookWorkersLocked(1);
+          if (more.empty()) break;
+          starts.push_back(std::move(more.front()));
+        }
+      }
+      for (std::size_t i = 0; i < wakes; ++i) wake.notify_one();
       if (!starts.empty()) {
         lock.unlock();
         startWorkers(starts);
@@ -278,20 +371,22 @@ bool WorkerPool::isWorkerThread() noexcept { return tWorker != nullptr; }
 
 std::size_t WorkerPool::width() const noexcept { return state_->width; }
 
-void WorkerPool::submit(std::function<void()> job) {
+void WorkerPool::submit(std::function<void()> job) { submit(std::move(job), nullptr, nullptr); }
+
+void WorkerPool::submit(std::function<void()> work, const void* queue,
+                        std::shared_ptr<const void> keepAlive) {
   State& s = *state_;
   bool wake = false;
   bool monitor = false;
   State::Starts starts;
   {
     std::lock_guard lock(s.mutex);
-    s.jobs.push_back(std::move(job));
-    // Wake an idle worker while there are at least as many idle workers as
-    // queued jobs; otherwise start one if fewer than the width are running.
-    if (s.jobs.size() <= s.idle) {
-      wake = true;
-    } else if (s.runningLocked() < s.width) {
-      starts = s.bookWorkersLocked(1);
+    s.jobs.push({std::move(work), queue, std::move(keepAlive)});
+    // While fewer than the width run, wake an idle worker or start one;
+    // otherwise a running worker takes the job when it is done with its own.
+    if (s.runningLocked() < s.width) {
+      wake = s.claimIdleLocked();
+      if (!wake) starts = s.bookWorkersLocked(1);
     }
     if (!wake && starts.empty()) monitor = s.armMonitorLocked();
   }
@@ -317,5 +412,26 @@ WorkerPool::BlockingScope::~BlockingScope() {
   --tBlockingDepth;
   if (counted_) WorkerPool::shared().state_->leaveBlocking();
 }
+
+namespace detail {
+
+CurrentQueueScope::CurrentQueueScope(const void* queue) {
+  // Deeper nesting than the stack holds is not remembered (isCurrent() then
+  // answers false for the innermost queues).
+  if (tQueueDepth < static_cast<int>(std::size(tQueues))) tQueues[tQueueDepth] = queue;
+  ++tQueueDepth;
+}
+
+CurrentQueueScope::~CurrentQueueScope() { --tQueueDepth; }
+
+bool CurrentQueueScope::contains(const void* queue) noexcept {
+  const int depth = std::min(tQueueDepth, static_cast<int>(std::size(tQueues)));
+  for (int i = 0; i < depth; ++i) {
+    if (tQueues[i] == queue) return true;
+  }
+  return false;
+}
+
+}  // namespace detail
 
 }  // namespace kivi

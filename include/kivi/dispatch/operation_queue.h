@@ -76,7 +76,7 @@ class OperationQueue : public Object, public OperationQueueProtocol {
   void setMaxConcurrentOperationCount(std::int64_t count) override;
   std::string name() const override;
   void setName(std::string name) override;
-  std::vector<OperationPtr> operations() const override;
+  [[nodiscard]] std::vector<OperationPtr> operations() const override;
   std::uint64_t operationCount() const override;
 
   // A suspended queue starts nothing new.

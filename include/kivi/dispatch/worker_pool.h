@@ -28,6 +28,7 @@
 
 #include <cstddef>
 #include <functional>
+#include <memory>
 
 namespace kivi {
 
@@ -36,6 +37,9 @@ class WorkerPool {
   static WorkerPool& shared();
 
   void submit(std::function<void()> job);
+  // For dispatch queues: the job runs as work of `queue`, which `keepAlive`
+  // (if any) keeps alive until the job has run.
+  void submit(std::function<void()> job, const void* queue, std::shared_ptr<const void> keepAlive);
 
   // Whether the calling thread is one of the pool's workers.
   static bool isWorkerThread() noexcept;

@@ -162,15 +162,16 @@ class URLSession : public Object {
   static std::shared_ptr<URLSession> sharedSession();
   // `delegateQueue`: where completion handlers run; a new serial queue when
   // null.
-  static std::shared_ptr<URLSession> sessionWithConfiguration(
+  [[nodiscard]] static std::shared_ptr<URLSession> sessionWithConfiguration(
       URLSessionConfiguration configuration,
       std::shared_ptr<OperationQueue> delegateQueue = nullptr);
   ~URLSession() override;
 
   // A suspended task; resume() sends the request.
-  URLSessionDataTaskPtr dataTaskWithRequest(const URLRequest& request,
-                                            DataTaskCompletionHandler completionHandler);
-  URLSessionDataTaskPtr dataTaskWithURL(URLPtr url, DataTaskCompletionHandler completionHandler);
+  [[nodiscard]] URLSessionDataTaskPtr dataTaskWithRequest(
+      const URLRequest& request, DataTaskCompletionHandler completionHandler);
+  [[nodiscard]] URLSessionDataTaskPtr dataTaskWithURL(URLPtr url,
+                                                      DataTaskCompletionHandler completionHandler);
 
   const URLSessionConfiguration& configuration() const noexcept { return configuration_; }
   const std::shared_ptr<OperationQueue>& delegateQueue() const noexcept { return delegateQueue_; }
