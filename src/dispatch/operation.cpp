@@ -1,36 +1,44 @@
 #include "kivi/dispatch/operation.h"
 
 #include <algorithm>
+#include <new>
 
 #include "kivi/dispatch/worker_pool.h"
 #include "operation_internals.h"
 
 namespace kivi {
 
-Operation::Operation() : state_(std::make_unique<detail::OperationState>()) {}
+static_assert(sizeof(detail::OperationState) <= detail::kOperationStateSize);
+static_assert(alignof(detail::OperationState) <= 16);
 
-Operation::~Operation() = default;
+Operation::Operation() { new (state_) detail::OperationState(); }
+
+Operation::~Operation() { state().~OperationState(); }
+
+detail::OperationState& Operation::state() const noexcept {
+  return *std::launder(reinterpret_cast<detail::OperationState*>(state_));
+}
 
 void Operation::start() {
   if (isAsynchronous()) return;
   if (isFinished() || isExecuting()) return;
   const bool cancelled = isCancelled();
   if (!cancelled && !isReady()) {
-    state_->refusedNotReady.store(true, std::memory_order_release);
+    state().refusedNotReady.store(true, std::memory_order_release);
     return;
   }
-  if (state_->baseStarted.exchange(true)) return;
+  if (state().baseStarted.exchange(true)) return;
   auto self = weak_from_this().lock();
   if (!cancelled) {
     willChangeValueForKey("isExecuting");
-    state_->baseExecuting = true;
+    state().baseExecuting = true;
     didChangeValueForKey("isExecuting");
     main();
   }
   willChangeValueForKey("isExecuting");
   willChangeValueForKey("isFinished");
-  state_->baseExecuting = false;
-  state_->baseFinished = true;
+  state().baseExecuting = false;
+  state().baseFinished = true;
   didChangeValueForKey("isFinished");
   didChangeValueForKey("isExecuting");
 }
@@ -38,10 +46,10 @@ void Operation::start() {
 void Operation::main() {}
 
 void Operation::cancel() {
-  if (state_->cancelAnnounced.exchange(true)) return;
+  if (state().cancelAnnounced.exchange(true)) return;
   auto self = weak_from_this().lock();
   willChangeValueForKey("isCancelled");
-  state_->cancelled = true;
+  state().cancelled = true;
   didChangeValueForKey("isCancelled");
   if (!isFinished()) {
     willChangeValueForKey("isReady");
@@ -49,19 +57,19 @@ void Operation::cancel() {
   }
 }
 
-bool Operation::isCancelled() const { return state_->cancelled; }
-bool Operation::isExecuting() const { return state_->baseExecuting; }
-bool Operation::isFinished() const { return state_->baseFinished; }
+bool Operation::isCancelled() const { return state().cancelled; }
+bool Operation::isExecuting() const { return state().baseExecuting; }
+bool Operation::isFinished() const { return state().baseFinished; }
 bool Operation::isAsynchronous() const { return false; }
 
 bool Operation::isReady() const {
   if (isCancelled()) return true;
-  if (state_->dependencyCount.load(std::memory_order_acquire) == 0) return true;
+  if (state().dependencyCount.load(std::memory_order_acquire) == 0) return true;
   std::vector<OperationPtr> dependencies;
   {
-    std::lock_guard lock(state_->mutex);
-    if (state_->dependencies.empty()) return true;
-    dependencies = state_->dependencies;
+    std::lock_guard lock(state().mutex);
+    if (state().dependencies.empty()) return true;
+    dependencies = state().dependencies;
   }
   return std::all_of(dependencies.begin(), dependencies.end(),
                      [](const OperationPtr& d) { return d->isFinished(); });
@@ -70,22 +78,22 @@ bool Operation::isReady() const {
 void Operation::addDependency(const OperationPtr& operation) {
   if (!operation || operation.get() == this) return;
   {
-    std::lock_guard lock(state_->mutex);
-    if (std::find(state_->dependencies.begin(), state_->dependencies.end(), operation) !=
-        state_->dependencies.end()) {
+    std::lock_guard lock(state().mutex);
+    if (std::find(state().dependencies.begin(), state().dependencies.end(), operation) !=
+        state().dependencies.end()) {
       return;
     }
   }
   auto self = weak_from_this().lock();
   willChangeValueForKey("isReady");
   {
-    std::lock_guard lock(state_->mutex);
-    state_->dependencies.push_back(operation);
-    state_->dependencyCount.store(state_->dependencies.size(), std::memory_order_release);
+    std::lock_guard lock(state().mutex);
+    state().dependencies.push_back(operation);
+    state().dependencyCount.store(state().dependencies.size(), std::memory_order_release);
   }
   if (self) {
-    std::lock_guard lock(operation->state_->mutex);
-    operation->state_->dependents.push_back(std::static_pointer_cast<Operation>(self));
+    std::lock_guard lock(operation->state().mutex);
+    operation->state().dependents.push_back(std::static_pointer_cast<Operation>(self));
   }
   didChangeValueForKey("isReady");
 }
@@ -95,13 +103,13 @@ void Operation::removeDependency(const OperationPtr& operation) {
   auto self = weak_from_this().lock();
   willChangeValueForKey("isReady");
   {
-    std::lock_guard lock(state_->mutex);
-    std::erase(state_->dependencies, operation);
-    state_->dependencyCount.store(state_->dependencies.size(), std::memory_order_release);
+    std::lock_guard lock(state().mutex);
+    std::erase(state().dependencies, operation);
+    state().dependencyCount.store(state().dependencies.size(), std::memory_order_release);
   }
   {
-    std::lock_guard lock(operation->state_->mutex);
-    std::erase_if(operation->state_->dependents, [this](const std::weak_ptr<Operation>& w) {
+    std::lock_guard lock(operation->state().mutex);
+    std::erase_if(operation->state().dependents, [this](const std::weak_ptr<Operation>& w) {
       auto op = w.lock();
       return !op || op.get() == this;
     });
@@ -110,39 +118,39 @@ void Operation::removeDependency(const OperationPtr& operation) {
 }
 
 std::vector<OperationPtr> Operation::dependencies() const {
-  std::lock_guard lock(state_->mutex);
-  return state_->dependencies;
+  std::lock_guard lock(state().mutex);
+  return state().dependencies;
 }
 
 std::function<void()> Operation::completionBlock() const {
-  std::lock_guard lock(state_->mutex);
-  return state_->completionBlock;
+  std::lock_guard lock(state().mutex);
+  return state().completionBlock;
 }
 
 void Operation::setCompletionBlock(std::function<void()> block) {
-  std::lock_guard lock(state_->mutex);
-  state_->completionBlock = std::move(block);
+  std::lock_guard lock(state().mutex);
+  state().completionBlock = std::move(block);
 }
 
 std::string Operation::name() const {
-  std::lock_guard lock(state_->mutex);
-  return state_->name;
+  std::lock_guard lock(state().mutex);
+  return state().name;
 }
 
 void Operation::setName(std::string name) {
   willChangeValueForKey("name");
   {
-    std::lock_guard lock(state_->mutex);
-    state_->name = std::move(name);
+    std::lock_guard lock(state().mutex);
+    state().name = std::move(name);
   }
   didChangeValueForKey("name");
 }
 
 void Operation::waitUntilFinished() {
-  if (state_->finishDelivered.load(std::memory_order_acquire)) return;
+  if (state().finishDelivered.load(std::memory_order_acquire)) return;
   // A futex of this operation's own: finishing wakes only its waiters.
   WorkerPool::BlockingScope blocking;
-  state_->finishDelivered.wait(false, std::memory_order_acquire);
+  state().finishDelivered.wait(false, std::memory_order_acquire);
 }
 
 Value Operation::valueForKey(std::string_view key) const {
@@ -167,27 +175,27 @@ void Operation::keyValueDidChange(std::string_view key) {
   if (key == "isFinished") {
     if (isFinished()) didFinish();
   } else if (key == "isReady") {
-    if (state_->queueStarted.load(std::memory_order_acquire)) return;
-    if (auto core = queueOf(*state_)) {
+    if (state().queueStarted.load(std::memory_order_acquire)) return;
+    if (auto core = queueOf(state())) {
       core->readinessChanged(*this);
     } else {
-      state_->readyEpoch.fetch_add(1);  // seen by a queue that is adding us right now
+      state().readyEpoch.fetch_add(1);  // seen by a queue that is adding us right now
     }
   }
 }
 
 void Operation::didFinish() {
-  if (state_->finishHandled.exchange(true)) return;
+  if (state().finishHandled.exchange(true)) return;
   auto self = weak_from_this().lock();
   std::vector<std::weak_ptr<Operation>> dependents;
   std::function<void()> completion;
   std::shared_ptr<detail::QueueCore> core;
   {
-    std::lock_guard lock(state_->mutex);
-    dependents.swap(state_->dependents);
-    completion = std::move(state_->completionBlock);
-    state_->completionBlock = nullptr;
-    core = state_->queue.lock();
+    std::lock_guard lock(state().mutex);
+    dependents.swap(state().dependents);
+    completion = std::move(state().completionBlock);
+    state().completionBlock = nullptr;
+    core = state().queue.lock();
   }
   for (const auto& weakDependent : dependents) {
     if (auto dependent = weakDependent.lock()) {
@@ -200,8 +208,8 @@ void Operation::didFinish() {
 }
 
 void Operation::deliverFinish() {
-  state_->finishDelivered.store(true, std::memory_order_release);
-  state_->finishDelivered.notify_all();
+  state().finishDelivered.store(true, std::memory_order_release);
+  state().finishDelivered.notify_all();
 }
 
 void BlockOperation::main() {

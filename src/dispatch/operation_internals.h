@@ -128,7 +128,7 @@ struct QueueCore : std::enable_shared_from_this<QueueCore> {
   // Under mutex: whether the queue has let each of `operations` go.
   static bool allDoneLocked(const std::vector<OperationPtr>& operations);
 
-  static OperationState& stateOf(const Operation& operation) { return *operation.state_; }
+  static OperationState& stateOf(const Operation& operation) { return operation.state(); }
 };
 
 }  // namespace kivi::detail

@@ -27,6 +27,7 @@
 // observed.
 #pragma once
 
+#include <cstddef>
 #include <functional>
 #include <memory>
 #include <string>
@@ -39,6 +40,9 @@ namespace kivi {
 namespace detail {
 struct OperationState;
 struct QueueCore;
+// Room for an operation's private state, kept inside the operation so that
+// making one allocates nothing more.
+inline constexpr std::size_t kOperationStateSize = 272;
 }  // namespace detail
 
 class Operation;
@@ -98,7 +102,9 @@ class Operation : public Object {
   // Marks the finish as complete (its queue has let go) and wakes waiters.
   void deliverFinish();
 
-  const std::unique_ptr<detail::OperationState> state_;
+  detail::OperationState& state() const noexcept;
+
+  alignas(16) mutable unsigned char state_[detail::kOperationStateSize];
 };
 
 // An operation whose work is a function.
