@@ -49,7 +49,8 @@ const std::string& document() {
               ",\"lon\":" + std::to_string(below(360'000'000) / 1e6 - 180) + "}";
       json += ",\"history\":[";
       for (int h = 0, n = static_cast<int>(below(10)); h < n; ++h) {
-        json += (h ? "," : "") + std::to_string(below(100'000));
+        if (h) json += ',';
+        json += std::to_string(below(100'000));
       }
       json += "]}";
     }
