@@ -1,9 +1,14 @@
 // Looks names up in arbitrary launch-file text. The first byte gives the
 // name's length (0 to 32), the name follows and the rest is the text.
-//   - any name: the lookup and the yes/no lookup return;
-//   - a plain name (ASCII letters, digits, "_", "-"): the plain search and the
-//     regular-expression lookup give the same answer. A name outside that
-//     alphabet is mapped into it, byte by byte, for this check.
+//   - any name: a lookup with a small step budget either decides or answers
+//     absent with an error; one that decided gives the same answer through
+//     the parser's full budget, and the yes/no lookup decides too. (A name
+//     that needs more is not given the full budget here: up to a second per
+//     input would starve the fuzzer.)
+//   - a plain name (ASCII letters, digits, "_", "-"): the regular-expression
+//     lookup decides within its budget and gives the plain search's answer.
+//     A name outside that alphabet is mapped into it, byte by byte, for this
+//     check.
 #include <algorithm>
 #include <cstddef>
 #include <cstdint>
@@ -17,6 +22,8 @@
 using kivi::fuzz::check;
 
 namespace {
+
+constexpr std::int32_t kQuickSteps = 16;
 
 std::string plainName(std::string_view name) {
   if (kivi::detail::isPlainUloKey(name)) return std::string(name);
@@ -37,11 +44,18 @@ extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size
   const std::string_view text = input.substr(1 + nameLength);
 
   const kivi::KivUloFileParser parser{std::string(text)};
-  (void)parser.getValue(name);
-  (void)parser.getBooleanValue(name, {"yes", "", "\u00e9"});
+  kivi::ErrorPtr error;
+  const auto quick = kivi::detail::uloValueByPattern(text, name, &error, kQuickSteps);
+  check(!error || !quick, "a stopped lookup answers absent", input);
+  if (!error) {
+    check(parser.getValue(name, &error) == quick && !error, "more steps, the same answer", input);
+    const bool yes = parser.getBooleanValue(name, {"yes", "", "\u00e9"}, &error);
+    check(!error && (!yes || quick), "the yes/no lookup decides alike", input);
+  }
 
   const std::string plain = plainName(name);
-  const auto byPattern = kivi::detail::uloValueByPattern(text, plain);
+  const auto byPattern = kivi::detail::uloValueByPattern(text, plain, &error);
+  check(error == nullptr, "a plain name's pattern search decides", input);
   const auto byPlainSearch = kivi::detail::uloValueByPlainSearch(text, plain);
   check(byPattern == byPlainSearch, "plain search agrees with the pattern", input);
   check(parser.getValue(plain) == byPlainSearch, "the parser takes the plain search", input);

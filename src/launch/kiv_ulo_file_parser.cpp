@@ -2,6 +2,7 @@
 
 #include <algorithm>
 #include <cstddef>
+#include <cstdint>
 
 #include "kivi/text/regular_expression.h"
 #include "kivi/text/unicode_text.h"
@@ -10,15 +11,8 @@ namespace kivi {
 namespace detail {
 namespace {
 
-// The step budget of a regular-expression lookup over `size` bytes of text.
-RegularExpression::StepLimit stepBudget(std::size_t size) {
-  constexpr std::size_t kMaxKilobytes = INT32_MAX / KivUloFileParser::kStepsPerKilobyte;
-  const std::size_t kilobytes = std::min(size / 1024 + 1, kMaxKilobytes);
-  return static_cast<RegularExpression::StepLimit>(kilobytes) * KivUloFileParser::kStepsPerKilobyte;
-}
-
-// Steps 5 and 6 of a lookup: trim the matched text, answer what follows its
-// first "=". A name that can match without its "=" (such as "A|") leaves none.
+// The value a match gives: the matched text, trimmed, after its first "=".
+// A name that can match without its "=" (such as "A|") leaves none.
 std::optional<std::string> valueOfMatch(std::string_view match) {
   const std::string_view trimmed = unicode::trimView(match);
   const std::size_t equals = trimmed.find('=');
@@ -60,13 +54,17 @@ bool isPlainUloKey(std::string_view key) {
   });
 }
 
-std::optional<std::string> uloValueByPattern(std::string_view text, std::string_view key) {
+std::optional<std::string> uloValueByPattern(std::string_view text, std::string_view key,
+                                             ErrorPtr* error,
+                                             std::optional<std::int32_t> stepLimit) {
+  if (error) *error = nullptr;
   std::string pattern;
   pattern.reserve(key.size() + 11);
   pattern.append(key).append("=.*[\\r\\n]+");
   const RegularExpressionPtr expression = RegularExpression::create(pattern);
   if (!expression) return std::nullopt;
-  const auto match = expression->firstMatch(text, kWholeText, stepBudget(text.size()));
+  const auto match = expression->firstMatch(
+      text, kWholeText, stepLimit.value_or(KivUloFileParser::stepBudget(text)), error);
   if (!match) return std::nullopt;
   return valueOfMatch(text.substr(match->location, match->length));
 }
@@ -96,14 +94,41 @@ std::optional<std::string> uloValueByPlainSearch(std::string_view text, std::str
 
 }  // namespace detail
 
-std::optional<std::string> KivUloFileParser::getValue(std::string_view key) const {
-  return detail::isPlainUloKey(key) ? detail::uloValueByPlainSearch(uloFile_, key)
-                                    : detail::uloValueByPattern(uloFile_, key);
+// Cost of the search, in steps of ten thousand saved backtracking states: a
+// name starting with a repetition tries every position of a line and runs to
+// the line's end from each, so its cost grows with each line's length
+// squared; lines end where "." stops. Lengths are counted in bytes, never
+// fewer than the characters the engine reads.
+std::int32_t KivUloFileParser::stepBudget(std::string_view text) {
+  constexpr std::uint64_t kMax = kMaxSteps;
+  // A line this long reaches the maximum by itself; the sum stays far from
+  // overflowing.
+  constexpr std::uint64_t kLongLine = std::uint64_t{1} << 24;
+  const std::uint64_t fixed = kBaseSteps + kStepsPerKilobyte * (text.size() / 1024 + 1);
+  if (fixed >= kMax) return kMaxSteps;
+  std::uint64_t squares = 0;  // of the lines' lengths, in bytes
+  for (std::size_t from = 0;;) {
+    const auto lineEnd = detail::findLineEnd(text, from);
+    const std::uint64_t length =
+        std::min<std::uint64_t>((lineEnd ? lineEnd->at : text.size()) - from, kLongLine);
+    squares += length * length;
+    if (fixed + squares * kStepsPerSquareKilobyte / (1024 * 1024) >= kMax) return kMaxSteps;
+    if (!lineEnd) break;
+    from = lineEnd->at + lineEnd->length;
+  }
+  return static_cast<std::int32_t>(fixed + squares * kStepsPerSquareKilobyte / (1024 * 1024));
+}
+
+std::optional<std::string> KivUloFileParser::getValue(std::string_view key, ErrorPtr* error) const {
+  if (!detail::isPlainUloKey(key)) return detail::uloValueByPattern(uloFile_, key, error);
+  if (error) *error = nullptr;
+  return detail::uloValueByPlainSearch(uloFile_, key);
 }
 
 bool KivUloFileParser::getBooleanValue(std::string_view key,
-                                       const std::vector<std::string>& validBooleanValues) const {
-  const auto value = getValue(key);
+                                       const std::vector<std::string>& validBooleanValues,
+                                       ErrorPtr* error) const {
+  const auto value = getValue(key, error);
   if (!value) return false;
   const std::string lowered = unicode::toLower(*value);
   return std::any_of(

@@ -5,8 +5,8 @@
 #include <cstdio>
 #include <string_view>
 
-#include "kivi/text/unicode_text.h"
 #include "kivi/net/url_components.h"
+#include "kivi/text/unicode_text.h"
 
 namespace kivi {
 
@@ -158,6 +158,14 @@ bool domainMatches(std::string_view host, std::string_view domain) {
          host[host.size() - domain.size() - 1] == '.';
 }
 
+// Whether `domain` is a single label ("org", "localhost", "org." with the
+// root's dot): a top-level domain or a name of the local network, never a
+// registrable domain.
+bool isSingleLabel(std::string_view domain) {
+  if (domain.ends_with('.')) domain.remove_suffix(1);
+  return domain.find('.') == std::string_view::npos;
+}
+
 // The directory of a request path (RFC 6265 section 5.1.4).
 std::string defaultPath(std::string_view path) {
   const std::size_t slash = path.rfind('/');
@@ -223,9 +231,11 @@ HTTPCookiePtr parseCookie(std::string_view text, const RequestFacts& request) {
     }
   }
 
-  if (domain.empty()) {
+  // A single-label Domain would reach every host under it: it is taken only
+  // from that very host, and then sets a host-only cookie.
+  if (domain.empty() || (domain == request.host && isSingleLabel(domain))) {
     p.domain = request.host;
-  } else if (domainMatches(request.host, domain)) {
+  } else if (domainMatches(request.host, domain) && !isSingleLabel(domain)) {
     p.domain = "." + domain;
   } else {
     return nullptr;

@@ -55,9 +55,10 @@ std::string encodeInvalidCharacters(std::string_view text) {
   return out;
 }
 
+// A component decoded; none when there is none or its bytes are not UTF-8.
 std::optional<std::string> decoded(const std::optional<std::string>& text) {
   if (!text) return std::nullopt;
-  return percent_encoding::decode(*text).value_or(*text);
+  return percent_encoding::decode(*text);
 }
 
 // The components of a URL's text, which always parses: the constructor is
@@ -97,7 +98,9 @@ std::optional<std::string> URL::host() const {
 
 std::optional<std::int64_t> URL::port() const { return parts(string_).port(); }
 
-std::string URL::path() const { return *decoded(parts(string_).percentEncodedPath()); }
+std::optional<std::string> URL::path() const {
+  return percent_encoding::decode(parts(string_).percentEncodedPath());
+}
 
 std::optional<std::string> URL::query() const { return parts(string_).percentEncodedQuery(); }
 

@@ -3,6 +3,8 @@
 #include <algorithm>
 #include <limits>
 
+#include "kivi/text/unicode_text.h"
+
 namespace kivi {
 
 namespace percent_encoding {
@@ -175,6 +177,7 @@ std::optional<std::string> decode(std::string_view text) {
     out += static_cast<char>(hexValue(text[i + 1]) * 16 + hexValue(text[i + 2]));
     i += 2;
   }
+  if (!unicode::isValidUTF8(out)) return std::nullopt;
   return out;
 }
 
@@ -225,14 +228,11 @@ bool parsePort(std::string_view text, std::optional<std::int64_t>& port) {
   return true;
 }
 
-// Decodes `text`, or gives it unchanged when it is not validly encoded.
-std::string decodedOrRaw(const std::string& text) {
-  return percent_encoding::decode(text).value_or(text);
-}
-
-std::optional<std::string> decodedOrRaw(const std::optional<std::string>& text) {
+// A stored component decoded; none when there is none or its bytes are not
+// UTF-8 (what is stored is always validly encoded).
+std::optional<std::string> decoded(const std::optional<std::string>& text) {
   if (!text) return std::nullopt;
-  return decodedOrRaw(*text);
+  return percent_encoding::decode(*text);
 }
 
 std::optional<std::string> encoded(const std::optional<std::string>& text, Component component) {
@@ -316,12 +316,12 @@ URLComponents URLComponents::fromURL(const URL& url) {
   return fromString(url.absoluteString()).value_or(URLComponents());
 }
 
-std::optional<std::string> URLComponents::user() const { return decodedOrRaw(user_); }
-std::optional<std::string> URLComponents::password() const { return decodedOrRaw(password_); }
-std::optional<std::string> URLComponents::host() const { return decodedOrRaw(host_); }
-std::string URLComponents::path() const { return decodedOrRaw(path_); }
-std::optional<std::string> URLComponents::query() const { return decodedOrRaw(query_); }
-std::optional<std::string> URLComponents::fragment() const { return decodedOrRaw(fragment_); }
+std::optional<std::string> URLComponents::user() const { return decoded(user_); }
+std::optional<std::string> URLComponents::password() const { return decoded(password_); }
+std::optional<std::string> URLComponents::host() const { return decoded(host_); }
+std::optional<std::string> URLComponents::path() const { return percent_encoding::decode(path_); }
+std::optional<std::string> URLComponents::query() const { return decoded(query_); }
+std::optional<std::string> URLComponents::fragment() const { return decoded(fragment_); }
 
 void URLComponents::setUser(const std::optional<std::string>& user) {
   user_ = encoded(user, Component::user);
@@ -384,9 +384,9 @@ std::optional<std::vector<URLQueryItem>> URLComponents::queryItems() const {
     const std::string_view piece = rest.substr(0, amp);
     const std::size_t equals = piece.find('=');
     URLQueryItem item;
-    item.name = decodedOrRaw(std::string(piece.substr(0, equals)));
+    item.name = percent_encoding::decode(piece.substr(0, equals)).value_or("");
     if (equals != std::string_view::npos) {
-      item.value = decodedOrRaw(std::string(piece.substr(equals + 1)));
+      item.value = percent_encoding::decode(piece.substr(equals + 1));
     }
     items.push_back(std::move(item));
     if (amp == std::string_view::npos) break;

@@ -5,6 +5,7 @@
 #include <unicode/utext.h>
 
 #include <algorithm>
+#include <string>
 #include <utility>
 
 #include "kivi/text/json_serialization.h"
@@ -39,6 +40,18 @@ ErrorPtr invalidPatternError(std::string_view pattern) {
                        {{"NSInvalidValue", Value(std::string(pattern))}});
 }
 
+// Why a search stopped early, from ICU's status; a status ICU gives for
+// nothing else here (an allocation failure) counts as running out of memory.
+ErrorPtr searchStoppedError(UErrorCode status, RegularExpression::StepLimit stepLimit) {
+  if (status == U_REGEX_TIME_OUT) {
+    return Error::create(RegularExpressionSearchErrorDomain, RegularExpressionStepLimitError,
+                         {{DebugDescriptionErrorKey, "The search used up its budget of " +
+                                                         std::to_string(stepLimit) + " steps."}});
+  }
+  return Error::create(RegularExpressionSearchErrorDomain, RegularExpressionBacktrackLimitError,
+                       {{DebugDescriptionErrorKey, "The search ran out of backtracking memory."}});
+}
+
 }  // namespace
 
 RegularExpression::RegularExpression(std::string pattern, RegularExpressionOptions options,
@@ -71,9 +84,18 @@ std::shared_ptr<const RegularExpression> RegularExpression::create(std::string_v
 
 std::size_t RegularExpression::enumerateMatches(std::string_view text, TextRange range,
                                                 const std::function<bool(TextRange)>& visit,
-                                                StepLimit stepLimit) const {
+                                                StepLimit stepLimit, ErrorPtr* error) const {
+  if (error) *error = nullptr;
   const std::size_t begin = std::min(range.location, text.size());
   const std::string_view slice = text.substr(begin, range.length);
+  if (slice.size() > static_cast<std::size_t>(INT32_MAX)) {
+    if (error) {
+      *error = Error::create(
+          RegularExpressionSearchErrorDomain, RegularExpressionTextTooLongError,
+          {{DebugDescriptionErrorKey, "The text is over 2 GiB, too long for the search."}});
+    }
+    return 0;
+  }
 
   // A UTF-8 UText reads the bytes in place; its native indexes are byte
   // offsets, so match boundaries need no mapping back.
@@ -81,25 +103,29 @@ std::size_t RegularExpression::enumerateMatches(std::string_view text, TextRange
   icu::LocalUTextPointer input(
       utext_openUTF8(nullptr, slice.data(), static_cast<int64_t>(slice.size()), &status));
   std::unique_ptr<icu::RegexMatcher> matcher(compiled_->pattern->matcher(status));
-  if (U_FAILURE(status) || !matcher) return 0;
-  if (stepLimit > 0) matcher->setTimeLimit(stepLimit, status);
+  if (matcher && stepLimit > 0) matcher->setTimeLimit(stepLimit, status);
+  if (U_FAILURE(status) || !matcher) {
+    if (error) *error = searchStoppedError(U_MEMORY_ALLOCATION_ERROR, stepLimit);
+    return 0;
+  }
   matcher->reset(input.getAlias());
 
   std::size_t count = 0;
-  while (U_SUCCESS(status) && matcher->find(status) && U_SUCCESS(status)) {
+  while (matcher->find(status) && U_SUCCESS(status)) {
     const int64_t start = matcher->start64(status);
     const int64_t end = matcher->end64(status);
     if (U_FAILURE(status)) break;
     ++count;
     if (!visit({begin + static_cast<std::size_t>(start), static_cast<std::size_t>(end - start)})) {
-      break;
+      return count;
     }
   }
+  if (U_FAILURE(status) && error) *error = searchStoppedError(status, stepLimit);
   return count;
 }
 
 std::optional<TextRange> RegularExpression::firstMatch(std::string_view text, TextRange range,
-                                                       StepLimit stepLimit) const {
+                                                       StepLimit stepLimit, ErrorPtr* error) const {
   std::optional<TextRange> first;
   enumerateMatches(
       text, range,
@@ -107,14 +133,14 @@ std::optional<TextRange> RegularExpression::firstMatch(std::string_view text, Te
         first = match;
         return false;
       },
-      stepLimit);
+      stepLimit, error);
   return first;
 }
 
 std::size_t RegularExpression::numberOfMatches(std::string_view text, TextRange range,
-                                               StepLimit stepLimit) const {
+                                               StepLimit stepLimit, ErrorPtr* error) const {
   return enumerateMatches(
-      text, range, [](TextRange) { return true; }, stepLimit);
+      text, range, [](TextRange) { return true; }, stepLimit, error);
 }
 
 }  // namespace kivi

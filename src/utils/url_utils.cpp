@@ -7,18 +7,23 @@ namespace kivi {
 
 namespace KiviOSSdkUtils {
 
+// The new items go behind the existing query's text as it stands, so that
+// existing items that do not decode (a value that is not UTF-8) keep their
+// text rather than losing it on the way through queryItems().
 void addQueryItems(URLComponents& components, const std::vector<URLQueryItem>& items) {
   if (items.empty()) return;
-  std::vector<URLQueryItem> all = components.queryItems().value_or(std::vector<URLQueryItem>{});
-  all.insert(all.end(), items.begin(), items.end());
-  components.setQueryItems(all);
+  const std::optional<std::string> existing = components.percentEncodedQuery();
+  components.setQueryItems(items);
+  if (existing && !existing->empty()) {
+    components.setPercentEncodedQuery(*existing + "&" + *components.percentEncodedQuery());
+  }
 }
 
 }  // namespace KiviOSSdkUtils
 
 std::map<std::string, std::string> getQueryItemsDictionary(std::string_view queryString) {
   std::map<std::string, std::string> dictionary;
-  const auto components = URLComponents::fromString("?" + std::string(queryString));
+  const auto components = URLComponents::fromString(std::string("?").append(queryString));
   if (!components) return dictionary;
   for (auto& item : components->queryItems().value_or(std::vector<URLQueryItem>{})) {
     if (item.value) dictionary[std::move(item.name)] = std::move(*item.value);

@@ -2,9 +2,12 @@
 
 #include <gtest/gtest.h>
 
+#include <cstdint>
 #include <optional>
 #include <string>
 #include <vector>
+
+#include "kivi/text/regular_expression.h"
 
 namespace kivi {
 namespace {
@@ -12,9 +15,19 @@ namespace {
 using namespace std::string_literals;
 using std::nullopt;
 
+// A launch file of the usual size and shape (about 1.7 KB), "FullScreen" last.
+std::string launchFile() {
+  std::string text = "[Launch]\r\n";
+  for (int i = 0; i < 40; ++i) {
+    text += "Setting" + std::to_string(i) + "=s:value of setting " + std::to_string(i) + "\r\n";
+  }
+  return text + "FullScreen=Yes\r\n";
+}
+
 // Every row runs through the parser, the regular-expression lookup and, for
-// plain names, the plain search: all must agree.
+// plain names, the plain search: all must agree, and every search decides.
 TEST(KivUloFileParserTest, LookupsAgreeOnEveryPath) {
+  const std::string bigValue = "Blob=" + std::string(4096, 'x') + "\r\n";
   const struct {
     std::string text;
     std::string key;
@@ -66,11 +79,22 @@ TEST(KivUloFileParserTest, LookupsAgreeOnEveryPath) {
        "A=2\n",
        "A", "2"},
       {"A=1\xc2\n", "A", "1\xc2"},
+      // Ordinary files whose search costs the engine more than a quick scan:
+      // a repetition before the name tries every position of each line.
+      {launchFile(), ".*Screen", "Yes"},
+      {launchFile(), "Full.creen", "Yes"},
+      {bigValue + "FullScreen=Yes\r\n", "\\w+Screen", "Yes"},
+      {bigValue + "FullScreen=Yes\r\n", "[A-Za-z]+Screen", "Yes"},
+      {std::string(3000, '=') + "\xff\v=x\n", "", "x"},
   };
   for (const auto& row : cases) {
-    SCOPED_TRACE(testing::PrintToString(row.text) + " key " + row.key);
-    EXPECT_EQ(KivUloFileParser(row.text).getValue(row.key), row.expected);
-    EXPECT_EQ(detail::uloValueByPattern(row.text, row.key), row.expected);
+    SCOPED_TRACE(testing::PrintToString(row.text.substr(0, 80)) + " key " + row.key);
+    ErrorPtr error = Error::create("stale", 1);
+    EXPECT_EQ(KivUloFileParser(row.text).getValue(row.key, &error), row.expected);
+    EXPECT_EQ(error, nullptr);
+    error = Error::create("stale", 1);
+    EXPECT_EQ(detail::uloValueByPattern(row.text, row.key, &error), row.expected);
+    EXPECT_EQ(error, nullptr);
     if (detail::isPlainUloKey(row.key)) {
       EXPECT_EQ(detail::uloValueByPlainSearch(row.text, row.key), row.expected);
     }
@@ -104,10 +128,39 @@ TEST(KivUloFileParserTest, LargeAdversarialTextsStayBounded) {
   std::string repeats;
   for (int i = 0; i < (1 << 19); ++i) repeats += "K=";
   EXPECT_EQ(KivUloFileParser(repeats + "\vK=ok\n").getValue("K"), "ok");
+}
 
-  // Quadratic for the engine: the step budget ends the search.
-  const std::string line(256 << 10, 'a');
-  EXPECT_EQ(KivUloFileParser(line + "\n").getValue(".*.*b"), nullopt);
+// A search that cannot decide within its budget answers absent (false) with
+// an error, never a plain absent; the same name decides on a short text.
+TEST(KivUloFileParserTest, RunawaySearchesStopWithAnError) {
+  const struct {
+    std::string text;
+    std::string key;
+    std::int64_t code;
+  } cases[] = {
+      // Cubic in the line's length, then exponential: both far over the
+      // budget of about 1,500 steps.
+      {std::string(1024, 'a') + "\n", ".*.*b", RegularExpressionStepLimitError},
+      {std::string(1024, 'a') + "\n", "(a|aa)*(a|aa)*b", RegularExpressionStepLimitError},
+      // One saved state per "a": the backtracking memory runs out first.
+      {std::string(1 << 20, 'a') + "=1\n", "(a|b)+", RegularExpressionBacktrackLimitError},
+  };
+  for (const auto& row : cases) {
+    SCOPED_TRACE(row.key);
+    const KivUloFileParser parser(row.text);
+    ErrorPtr error;
+    EXPECT_EQ(parser.getValue(row.key, &error), nullopt);
+    ASSERT_NE(error, nullptr);
+    EXPECT_EQ(error->domain(), RegularExpressionSearchErrorDomain);
+    EXPECT_EQ(error->code(), row.code);
+    error = nullptr;
+    EXPECT_FALSE(parser.getBooleanValue(row.key, {""}, &error));
+    EXPECT_NE(error, nullptr);
+
+    const KivUloFileParser decided(row.text.substr(0, 20) + "b=1\n");
+    EXPECT_EQ(decided.getValue(row.key, &error), "1");
+    EXPECT_EQ(error, nullptr);
+  }
 }
 
 }  // namespace

@@ -105,11 +105,12 @@ TEST(ObfuscateHeadersForLoggingTest, KeepsOnlyTheNamedValuesAndMasksEvenEmptyOne
 
 TEST(CookiesForLoggingTest, KeepsNameAndDomainOnly) {
   const auto cookies = HTTPCookie::cookiesWithResponseHeaderFields(
-      {{"Set-Cookie", "a=1; Domain=d; Path=/p; Secure, b="}}, *URL::URLWithString("https://d/"));
+      {{"Set-Cookie", "a=1; Domain=h.d; Path=/p; Secure, b="}},
+      *URL::URLWithString("https://h.d/"));
   EXPECT_EQ(HTTPCookieUtils::cookiesForLogging(cookies),
             (std::vector<Dictionary>{
-                {{HTTPCookieName, "a"}, {HTTPCookieValue, "***"}, {HTTPCookieDomain, ".d"}},
-                {{HTTPCookieName, "b"}, {HTTPCookieValue, ""}, {HTTPCookieDomain, "d"}}}));
+                {{HTTPCookieName, "a"}, {HTTPCookieValue, "***"}, {HTTPCookieDomain, ".h.d"}},
+                {{HTTPCookieName, "b"}, {HTTPCookieValue, ""}, {HTTPCookieDomain, "h.d"}}}));
 }
 
 // Random URLs, headers and cookies whose secret values use only letters that

@@ -43,6 +43,15 @@ TEST(CookieParsingTest, DomainPathAndSplittingFollowRFC6265) {
       {"https://example.com/", "a=1; Domain=www.example.com", {}},
       {"https://www.example.com/", "a=1; Domain=", {"a=1 www.example.com /"}},
       {"https://10.0.0.1/", "a=1; Domain=0.0.1", {}},
+      // A single label reaches a whole top-level domain: refused, unless it
+      // is the host itself, which then gets a host-only cookie.
+      {"https://home.example.org/", "a=1; Domain=.org", {}},
+      {"https://home.example.org/", "a=1; Domain=ORG", {}},
+      {"https://home.example.org./", "a=1; Domain=org.", {}},
+      {"https://home.example.org/", "a=1; Domain=example.org", {"a=1 .example.org /"}},
+      {"http://localhost/", "a=1; Domain=LocalHost", {"a=1 localhost /"}},
+      {"http://localhost/", "a=1; Domain=.localhost", {"a=1 localhost /"}},
+      {"http://app.localhost/", "a=1; Domain=localhost", {}},
       {"https://[::1]/", "a=1", {"a=1 ::1 /"}},
       // Several cookies in one field; an Expires comma does not split.
       {"https://h/",

@@ -11,9 +11,9 @@
 #include <string_view>
 #include <vector>
 
+#include "kivi/base/value.h"
 #include "kivi/net/http_cookie.h"
 #include "kivi/net/url_components.h"
-#include "kivi/base/value.h"
 
 namespace kivi {
 
@@ -28,6 +28,7 @@ static void PrintTo(const URLQueryItem& item, std::ostream* os) {
 
 namespace {
 
+using namespace std::string_literals;
 using std::nullopt;
 
 // The space-separated texts of `list`.
@@ -44,7 +45,8 @@ TEST(URLTest, ParsesRFC3986ReferencesAndRefusesTheRest) {
   const auto accepted = texts(
       "https://api.example.com/v1/items?a=1#top http://[::1]:8080/ http://[2001:db8::7]/x "
       "http://[::ffff:192.0.2.1]/ http://[1:2:3:4:5:6:7::]/ http://[v1.fe80::a+en1]/ http://h:/ "
-      "ftp://us%65r:pa:ss@h/ //h/p /p?q=/?#f? p/q:r mailto:a@b a+b.c-d:x %41");
+      "ftp://us%65r:pa:ss@h/ //h/p /p?q=/?#f? p/q:r mailto:a@b a+b.c-d:x %41 "
+      "http://h/%c3%a9?q=%e9#%7e");
   auto refused = texts(
       "http://[1:2:3:4:5:6:7:8:9]/ http://[1::2::3]/ http://[1:2:3:4::5:6:7:8]/ "
       "http://[::1.2.3.04]/ http://[vz.x]/ http://[::256.1.1.1]/ http://[::1 http://[::1]x/ "
@@ -96,6 +98,38 @@ TEST(URLTest, AccessorsDecodeHostPathAndUserButNotQueryOrFragment) {
   EXPECT_FALSE(bare->scheme() || bare->host() || bare->port() || bare->query());
   EXPECT_EQ(URL::URLWithString("http://[::1]:1/")->host(), "::1");
   EXPECT_EQ(URL::URLWithString("http://h?")->query(), "");
+}
+
+// Escapes decode in either case; a component whose decoded bytes are not
+// UTF-8 is absent, from URL and URLComponents alike.
+TEST(URLTest, DecodedComponentsAreUTF8OrAbsent) {
+  using O = std::optional<std::string>;
+  const struct {
+    const char* text;
+    O user, password, host, path, query, fragment;  // the last two: URLComponents only
+  } cases[] = {
+      {"http://%c3%a9:%C3%a9@%c3%A9/%c3%a9?%c3%a9#%c3%a9", "\u00e9", "\u00e9", "\u00e9", "/\u00e9",
+       "\u00e9", "\u00e9"},
+      {"http://%E9:%e9@%E9/%e9?%E9#%e9", nullopt, nullopt, nullopt, nullopt, nullopt, nullopt},
+      {"http://u@h/a%C3?%ED%A0%80#%C0%AF", "u", nullopt, "h", nullopt, nullopt, nullopt},
+      {"http://u:@h/%F4%8F%BF%BF%00", "u", "", "h", "/\U0010FFFF\0"s, nullopt, nullopt},
+  };
+  for (const auto& row : cases) {
+    SCOPED_TRACE(row.text);
+    const URLPtr url = URL::URLWithString(row.text, false);
+    ASSERT_TRUE(url);
+    const URLComponents components = URLComponents::fromURL(*url);
+    EXPECT_EQ(url->user(), row.user);
+    EXPECT_EQ(components.user(), row.user);
+    EXPECT_EQ(url->password(), row.password);
+    EXPECT_EQ(components.password(), row.password);
+    EXPECT_EQ(url->host(), row.host);
+    EXPECT_EQ(components.host(), row.host);
+    EXPECT_EQ(url->path(), row.path);
+    EXPECT_EQ(components.path(), row.path);
+    EXPECT_EQ(components.query(), row.query);
+    EXPECT_EQ(components.fragment(), row.fragment);
+  }
 }
 
 TEST(URLComponentsTest, DecodedSettersEncodeWithTheComponentsOwnSet) {
@@ -158,6 +192,11 @@ TEST(URLComponentsTest, QueryItemsSplitTheQueryAndAnyNamesAndValuesRoundTrip) {
       {"s:p?a=1&b=&c&=x&&d=e=f",
        V{{"a", "1"}, {"b", ""}, {"c", nullopt}, {"", "x"}, {"", nullopt}, {"d", "e=f"}}},
       {"s:p?a+b=%2B%20%26", V{{"a+b", "+ &"}}},
+      // Either case of hex digit; bytes that are not UTF-8 give no value,
+      // and an empty name.
+      {"s:p?%c3%a9=%e2%82%ac&b=%C3%a9", V{{"\u00e9", "\u20ac"}, {"b", "\u00e9"}}},
+      {"s:p?a=%E9&b=%c3&%FF=1&%e9&c=%C3%A9%FF",
+       V{{"a", nullopt}, {"b", nullopt}, {"", "1"}, {"", nullopt}, {"c", nullopt}}},
   };
   for (const auto& [text, items] : cases) {
     EXPECT_EQ(URLComponents::fromString(text)->queryItems(), items) << text;
@@ -240,7 +279,6 @@ TEST(URLTest, IsAValueKindComparedByText) {
 }
 
 TEST(HTTPCookieTest, RefusesNamesValuesAndAttributesACookieCannotCarry) {
-  using namespace std::string_literals;
   const struct {
     std::string name, value, domain, path;
     bool accepted;

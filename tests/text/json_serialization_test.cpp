@@ -149,26 +149,33 @@ TEST(JSONSerialization, RefusesInvalidTextsSayingWhatAndWhere) {
 }
 
 TEST(JSONSerialization, DepthIsLimitedOnReadingAndWriting) {
-  // Each shape repeated `deepest` times nests 1024 levels; once more is too deep.
+  // Each shape repeated `deepest` times around `inner` nests exactly 1024
+  // levels; once more is too deep. `careful` holds an integer beyond 64 bits
+  // at the same depth, which sends the text to the careful reader.
+  const std::string big(kBeyond64Bits.substr(1, 20));
   const struct {
-    std::string open, close, inner;
+    std::string open, close, inner, careful;
     std::size_t deepest;
     int column;  // of the 1025th level
-  } shapes[] = {{"[", "]", "1", 1024, 1025},
-                {"{\"[\\\"\":", "}", "1", 1024, 7169},  // a key holding [ and "
-                {"[{\"k\":", "}]", "1", 512, 3073}};
+  } shapes[] = {{"[", "]", "1", big, 1024, 1025},
+                {"{\"[\\\"\":", "}", "1", big, 1024, 7169},  // a key holding [ and "
+                {"[{\"k\":", "}]", "1", big, 512, 3073},
+                // An empty innermost container, which simdjson counts as no
+                // level, is a level all the same.
+                {"[", "]", "", "", 1024, 1025},
+                {"[", "]", "{}", "{\"k\":" + big + "}", 1023, 1025},
+                {"{\"k\":", "}", "[]", "[" + big + "]", 1023, 5121}};
   for (const auto& c : shapes) {
     SCOPED_TRACE(c.open + c.inner);
-    // The integer sends the text the careful way.
-    for (const std::string_view inner : {std::string_view(c.inner), kBeyond64Bits.substr(1, 20)}) {
+    const std::string tooDeep =
+        "Too deeply nested around line 1, column " + std::to_string(c.column) + ".";
+    for (const std::string& inner : {c.inner, c.careful}) {
       const auto value = JSONSerialization::JSONObjectWithData(
           nested(c.deepest, c.open, c.close, inner), 0, nullptr);
       ASSERT_TRUE(value.has_value()) << inner;
       EXPECT_TRUE(JSONSerialization::isValidJSONObject(*value));
+      EXPECT_EQ(readFailure(nested(c.deepest + 1, c.open, c.close, inner)), tooDeep) << inner;
     }
-    const std::string tooDeep =
-        "Too deeply nested around line 1, column " + std::to_string(c.column) + ".";
-    EXPECT_EQ(readFailure(nested(c.deepest + 1, c.open, c.close, c.inner)), tooDeep);
     EXPECT_EQ(readFailure(nested(10'000, c.open, c.close, c.inner)), tooDeep);
   }
 

@@ -1,7 +1,9 @@
 #include "kivi/text/regular_expression.h"
 
 #include <gtest/gtest.h>
+#include <sys/mman.h>
 
+#include <cstdint>
 #include <string>
 #include <thread>
 #include <vector>
@@ -63,10 +65,51 @@ TEST(RegularExpressionTest, EnumeratesMatchesAndHonoursTheStepLimit) {
   EXPECT_EQ(b->enumerateMatches("bb_b_b", kWholeText, visit), 2u);
   EXPECT_EQ(seen, (std::vector<TextRange>{{0, 2}, {3, 1}}));
 
-  // Exponential backtracking: the budget ends it.
+  // A search that stops early says why; one that ends, or that its visitor
+  // ends, sets no error. Matches found before the stop stand.
   const auto runaway = RegularExpression::create("(a|aa)*c");
-  EXPECT_EQ(runaway->firstMatch(std::string(64, 'a'), kWholeText, 10), std::nullopt);
-  EXPECT_EQ(runaway->firstMatch(std::string(64, 'a') + "c", kWholeText, 10), (TextRange{0, 65}));
+  const auto grouped = RegularExpression::create("(a|b)+c|x");
+  const std::string as(64, 'a');
+  const std::string million(1 << 20, 'a');
+  const struct {
+    RegularExpressionPtr expression;
+    std::string text;
+    RegularExpression::StepLimit limit;
+    std::size_t matches;
+    std::int64_t code;  // 0: no error
+  } cases[] = {
+      {runaway, as, 10, 0, RegularExpressionStepLimitError},
+      {runaway, as + "c", 10, 1, 0},
+      {runaway, "c" + as, 10, 1, RegularExpressionStepLimitError},
+      // A saved state per letter: a million letters are too many.
+      {grouped, "x" + million + "c", 0, 1, RegularExpressionBacktrackLimitError},
+      {grouped, "x" + million.substr(0, 1000) + "c", 0, 2, 0},
+  };
+  for (const auto& row : cases) {
+    SCOPED_TRACE(row.expression->pattern() + " " + row.text.substr(0, 8));
+    ErrorPtr error = Error::create("stale", 1);
+    EXPECT_EQ(row.expression->numberOfMatches(row.text, kWholeText, row.limit, &error),
+              row.matches);
+    EXPECT_EQ(error ? error->code() : 0, row.code);
+    EXPECT_EQ(error ? error->domain() : RegularExpressionSearchErrorDomain,
+              RegularExpressionSearchErrorDomain);
+  }
+  ErrorPtr error = Error::create("stale", 1);
+  EXPECT_EQ(runaway->enumerateMatches(
+                "c" + as, kWholeText, [](TextRange) { return false; }, 10, &error),
+            1u);
+  EXPECT_EQ(error, nullptr);
+
+  // Over 2 GiB of text (reserved, never touched): refused before reading.
+  const std::size_t size = (std::size_t{1} << 31) + 1;
+  void* huge = mmap(nullptr, size, PROT_READ, MAP_PRIVATE | MAP_ANONYMOUS | MAP_NORESERVE, -1, 0);
+  ASSERT_NE(huge, MAP_FAILED);
+  const std::string_view text(static_cast<const char*>(huge), size);
+  EXPECT_EQ(b->firstMatch(text, kWholeText, 0, &error), std::nullopt);
+  EXPECT_EQ(error ? error->code() : 0, RegularExpressionTextTooLongError);
+  EXPECT_EQ(b->firstMatch(text, {size - 5, 5}, 0, &error), std::nullopt);
+  EXPECT_EQ(error, nullptr);
+  munmap(huge, size);
 }
 
 TEST(RegularExpressionTest, OneExpressionServesManyThreads) {

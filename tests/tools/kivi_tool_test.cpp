@@ -179,6 +179,7 @@ TEST(KiviToolTest, TextCommands) {
        "Set-Cookie: a=***, path=/, domain=d;\nset-cookie: b=2\n"},
       {{"ulo", "get", "-", "B"}, "A=1\r\nB=2\r\n", 0, "2\n"},
       {{"ulo", "get", "-", "C"}, "A=1\r\nB=2\r\n", 1, ""},
+      {{"ulo", "get", "-", ".*.*b"}, std::string(1024, 'a') + "\n", 3, ""},
       {{"ulo", "get", "-", "A"}, "A=\xff\n", 2, ""},
       {{"ulo", "get", "-"}, "A=1\n", 2, ""},
       {{"ulo", "bool", "-", "Flag", "on"}, "Flag=ON\r\n", 0, "true\n"},

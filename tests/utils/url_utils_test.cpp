@@ -28,6 +28,8 @@ TEST(AddQueryItemsTest, AppendsToExistingItemsAndLeavesAnEmptyListAlone) {
       {"https://h/p?a=%41", {}, "https://h/p?a=%41"},
       // An empty query holds no items: the new ones replace it.
       {"https://h/p?", {{"b", "2"}}, "https://h/p?b=2"},
+      // Existing items keep their text, even where it does not decode.
+      {"https://h/p?a=%E9&b=%c3%a9&", {{"c", "\u00e9"}}, "https://h/p?a=%E9&b=%c3%a9&&c=%C3%A9"},
   };
   for (const auto& row : cases) {
     SCOPED_TRACE(row.url);
@@ -49,6 +51,7 @@ TEST(GetQueryItemsDictionaryTest, KeepsItemsWithValuesDecodedLastOneWinning) {
       {"a=1&a=2&a", {{"a", "2"}}},
       {"a+b=c+d&=v&e==", {{"a+b", "c+d"}, {"", "v"}, {"e", "="}}},
       {"k=%26%3D&n=%C3%A9", {{"k", "&="}, {"n", "\xC3\xA9"}}},
+      {"n=%c3%a9&v=%E9&%FF=1", {{"n", "\u00e9"}, {"", "1"}}},  // %E9 alone is not UTF-8
       {"x=1#y=2", {{"x", "1"}}},
       {"a=b c", {}},  // not a query
       {"a=%zz", {}},  // nor is this

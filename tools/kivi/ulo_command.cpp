@@ -6,8 +6,8 @@
 #include <ostream>
 
 #include "command.h"
-#include "kivi/text/unicode_text.h"
 #include "kivi/launch/kiv_ulo_file_parser.h"
+#include "kivi/text/unicode_text.h"
 
 namespace kivi::tool {
 
@@ -58,14 +58,25 @@ int runUlo(const std::vector<std::string>& args, std::ostream& out, std::ostream
   const auto text = readLaunchFile(args[1], err);
   if (!text) return 2;
   const KivUloFileParser parser(*text);
+  ErrorPtr undecided;
+  // A search that ran out of its budget has no answer: say so, do not guess.
+  const auto noAnswer = [&] {
+    err << "kivi ulo " << args[0] << ": the search for '" << args[2]
+        << "' stopped before it could decide ("
+        << undecided->userInfo().at(DebugDescriptionErrorKey).description() << ")\n";
+    return 3;
+  };
   if (get) {
-    const auto value = parser.getValue(args[2]);
+    const auto value = parser.getValue(args[2], &undecided);
+    if (undecided) return noAnswer();
     if (!value) return 1;
     out << *value << "\n";
     return 0;
   }
   const std::vector<std::string> trueValues(args.begin() + 3, args.end());
-  out << (parser.getBooleanValue(args[2], trueValues) ? "true" : "false") << "\n";
+  const bool yes = parser.getBooleanValue(args[2], trueValues, &undecided);
+  if (undecided) return noAnswer();
+  out << (yes ? "true" : "false") << "\n";
   return 0;
 }
 
@@ -87,7 +98,8 @@ Command uloCommand() {
           "        setting is absent or no TRUE_VALUE is given\n\n"
           "Exit code: 0 when a value or answer was printed, 1 when get finds no\n"
           "setting, 2 for bad arguments and for a file that cannot be read or is not\n"
-          "valid UTF-8.\n",
+          "valid UTF-8, 3 when a KEY with regular-expression syntax made the search\n"
+          "too costly to finish (no answer either way).\n",
           runUlo};
 }
 

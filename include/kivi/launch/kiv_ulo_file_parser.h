@@ -21,10 +21,22 @@
 //
 // Text that is not valid UTF-8 is searched with each malformed sequence read
 // as U+FFFD; values are handed back byte for byte as they stand in the text.
-// A regular-expression lookup is bounded by a step budget that grows with the
-// text (kStepsPerKilobyte), so that a pathological name over a huge text
-// answers absent instead of running for hours; plain names need no budget.
-// (In a text over 2 GiB only plain names are found: ICU's input bound.)
+// In a text over 2 GiB (ICU's input bound) only plain names can be looked up:
+// other names are undecided, as below.
+//
+// A name with regular-expression syntax can make a search take very long
+// (".*.*b" costs the cube of a line's length). Such a lookup has a step
+// budget, stepBudget(), which stops a runaway search within about two minutes
+// whatever the text, and which is four times what a name with one repetition
+// (".*Screen", "\w+Screen") needs on any text whose lines' lengths, squared,
+// add up to less than 300 square KiB: a few hundred lines of 1 KiB, or one
+// line of 17 KiB. A lookup stopped by the budget has no answer: it gives
+// absent (false for the yes/no lookup) and sets *error, which stays nullptr
+// for every lookup that decided. Plain names never stop early.
+//
+//   kivi::ErrorPtr error;
+//   const auto value = ulo.getValue(name, &error);
+//   if (error) { /* undecided: error->domain() is RegularExpressionSearchErrorDomain */ }
 //
 // Thread contract: a parser is immutable after construction; lookups on one
 // parser may run on any number of threads at once.
@@ -36,25 +48,39 @@
 #include <string_view>
 #include <vector>
 
+#include "kivi/base/error.h"
+
 namespace kivi {
 
 class KivUloFileParser {
  public:
-  // ICU match steps allowed per KiB of text (at least one KiB's worth) for a
-  // lookup that goes through the regular-expression engine.
-  static constexpr std::int32_t kStepsPerKilobyte = 2;
+  // The step budget of a regular-expression lookup, in RegularExpression's
+  // steps of 0.2 to 1 ms: kBaseSteps, plus kStepsPerKilobyte for each KiB of
+  // text, plus kStepsPerSquareKilobyte for each line's length in KiB squared,
+  // at most kMaxSteps. (".*" at the start of a name costs about 50 steps per
+  // square KiB of each line, "\w+" about 100.)
+  static constexpr std::int32_t kBaseSteps = 1024;
+  static constexpr std::int32_t kStepsPerKilobyte = 4;
+  static constexpr std::int32_t kStepsPerSquareKilobyte = 420;
+  static constexpr std::int32_t kMaxSteps = 1 << 17;
 
   explicit KivUloFileParser(std::string uloFile) : uloFile_(std::move(uloFile)) {}
 
   // The setting's value, or absent when the name is not set on a line ending
   // in CR or LF, or does not compile as a pattern. An empty value is "".
-  std::optional<std::string> getValue(std::string_view key) const;
+  // *error (when given) is nullptr, or the search's error when it stopped
+  // before it could decide (the answer is then absent, meaning "unknown").
+  std::optional<std::string> getValue(std::string_view key, ErrorPtr* error = nullptr) const;
 
   // Whether the value, lower-cased (full Unicode mapping, root locale), is
   // canonically equal to an entry of `validBooleanValues`. Entries are taken
-  // as given, neither lower-cased nor trimmed. False when the value is absent.
-  bool getBooleanValue(std::string_view key,
-                       const std::vector<std::string>& validBooleanValues) const;
+  // as given, neither lower-cased nor trimmed. False when the value is absent;
+  // *error as for getValue().
+  bool getBooleanValue(std::string_view key, const std::vector<std::string>& validBooleanValues,
+                       ErrorPtr* error = nullptr) const;
+
+  // The step budget of a regular-expression lookup in `text` (see above).
+  static std::int32_t stepBudget(std::string_view text);
 
  private:
   const std::string uloFile_;
@@ -66,8 +92,12 @@ namespace detail {
 // name included), so that its pattern has no special characters.
 bool isPlainUloKey(std::string_view key);
 
-// The lookup through the regular-expression engine, for any name.
-std::optional<std::string> uloValueByPattern(std::string_view text, std::string_view key);
+// The lookup through the regular-expression engine, for any name, with
+// `stepLimit` steps (none: KivUloFileParser::stepBudget(text); 0: no limit);
+// *error as for getValue().
+std::optional<std::string> uloValueByPattern(std::string_view text, std::string_view key,
+                                             ErrorPtr* error = nullptr,
+                                             std::optional<std::int32_t> stepLimit = std::nullopt);
 
 // The same lookup as a plain search; `key` must be plain.
 std::optional<std::string> uloValueByPlainSearch(std::string_view text, std::string_view key);

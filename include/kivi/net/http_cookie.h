@@ -18,9 +18,9 @@
 #include <vector>
 
 #include "kivi/base/object.h"
+#include "kivi/base/value.h"
 #include "kivi/net/url.h"
 #include "kivi/net/url_request.h"
-#include "kivi/base/value.h"
 
 namespace kivi {
 
@@ -64,6 +64,10 @@ class HTTPCookie : public Object {
   //   - Domain=d: the domain is "." + d (lowercased, one leading dot
   //     dropped), and the cookie is left out unless the host domain-matches
   //     d (equal, or a name under d; an IP address only equal);
+  //   - Domain=d where d is a single label ("org", "localhost"; a trailing
+  //     dot aside): left out, so that no host sets a cookie for a whole
+  //     top-level domain, unless the host is d itself ("localhost" setting
+  //     Domain=localhost), which gets a host-only cookie;
   //   - no Path attribute, or one not starting with "/": the directory of
   //     the URL's path as written, percent-encoded ("/" for "/x", "/a" for
   //     "/a/b");
@@ -76,7 +80,8 @@ class HTTPCookie : public Object {
   //     or value that a cookie cannot carry (see cookieWithProperties) gives
   //     no cookie; neither does a URL without a host.
   // Unparsable attribute values (a date that is not one, a Max-Age that is
-  // not a number) are ignored. The public suffix list is not consulted.
+  // not a number) are ignored. The public suffix list is not consulted:
+  // "a.co.uk" may still set Domain=co.uk.
   static std::vector<HTTPCookiePtr> cookiesWithResponseHeaderFields(
       const StringDictionary& headerFields, const URL& url);
 

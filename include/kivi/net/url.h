@@ -33,15 +33,17 @@ class URL : public Object {
   const std::string& absoluteString() const noexcept { return string_; }
 
   // Components. Each is absent when the URL has none; user(), password(),
-  // host() and path() are percent-decoded (as written when that fails), an
-  // IP-literal host without its brackets ("::1" for "[::1]"); query() and
-  // fragment() are as written (encoded).
+  // host() and path() are percent-decoded ("%c3%a9" and "%C3%A9" both give
+  // "é"), and absent when the decoded bytes are not UTF-8 ("%E9" alone); an
+  // IP-literal host comes without its brackets ("::1" for "[::1]"). path()
+  // is "" for a URL without one. query() and fragment() are as written
+  // (encoded).
   std::optional<std::string> scheme() const;
   std::optional<std::string> user() const;
   std::optional<std::string> password() const;
   std::optional<std::string> host() const;
   std::optional<std::int64_t> port() const;
-  std::string path() const;
+  std::optional<std::string> path() const;
   std::optional<std::string> query() const;
   std::optional<std::string> fragment() const;
 

@@ -2,13 +2,15 @@
 // password, host, port, path, query and fragment, and the query into items.
 //
 // Each component can be read and written decoded (user(), setHost(), …) or
-// percent-encoded (percentEncodedUser(), setPercentEncodedHost(), …). Decoded
+// percent-encoded (percentEncodedUser(), setPercentEncodedHost(), …). "%XX"
+// takes hex digits in either case. A component whose decoded bytes are not
+// UTF-8 ("%E9" alone) is absent decoded but stays readable encoded. Decoded
 // values are encoded, when text is produced, with the component's own allowed
 // character set: the URL user, password, host, path, query and fragment
 // allowed sets of RFC 3986. Query item names and values are additionally
 // encoded where "&", "=", "+" and "#" would change the query's meaning, so
-// any name and value come back unchanged through queryItems(). An IP-literal
-// host keeps its brackets here ("[::1]"), encoded or not.
+// any UTF-8 name and value come back unchanged through queryItems(). An
+// IP-literal host keeps its brackets here ("[::1]"), encoded or not.
 //
 //   auto c = kivi::URLComponents::fromString("https://h/p?a=1");
 //   auto items = c->queryItems().value_or(std::vector<kivi::URLQueryItem>{});
@@ -45,13 +47,14 @@ class URLComponents {
   // The components of `url`, without resolving it against a base URL.
   static URLComponents fromURL(const URL& url);
 
-  // Decoded components.
+  // Decoded components; absent when there is none or its decoded bytes are
+  // not UTF-8 (the path is "" when the text has none).
   std::optional<std::string> scheme() const { return scheme_; }
   std::optional<std::string> user() const;
   std::optional<std::string> password() const;
   std::optional<std::string> host() const;
   std::optional<std::int64_t> port() const { return port_; }
-  std::string path() const;
+  std::optional<std::string> path() const;
   std::optional<std::string> query() const;
   std::optional<std::string> fragment() const;
 
@@ -81,8 +84,10 @@ class URLComponents {
   bool setPercentEncodedFragment(std::optional<std::string> fragment);
 
   // The query split at "&" into items, each split at its first "="; names
-  // and values decoded ("+" stays "+"). None when there is no query; an
-  // empty query (a bare "?") gives no items.
+  // and values decoded ("+" stays "+"). A value whose decoded bytes are not
+  // UTF-8 is absent, like a bare name's; such a name reads as "" (an item
+  // that cannot be looked up by name). None when there is no query; an empty
+  // query (a bare "?") gives no items.
   std::optional<std::vector<URLQueryItem>> queryItems() const;
   // Replaces the query; none removes it, an empty list leaves an empty query.
   void setQueryItems(const std::optional<std::vector<URLQueryItem>>& items);
@@ -115,7 +120,8 @@ namespace percent_encoding {
 enum class Component { user, password, host, path, query, fragment, queryItem };
 // Encodes every byte that `component` does not allow, as %XX.
 std::string encode(std::string_view text, Component component);
-// Decodes %XX sequences; none when a "%" is not followed by two hex digits.
+// Decodes %XX sequences (either case of hex digit); none when a "%" is not
+// followed by two hex digits or the decoded bytes are not UTF-8.
 std::optional<std::string> decode(std::string_view text);
 // Whether `text` uses only bytes `component` allows and well-formed %XX.
 bool isValidlyEncoded(std::string_view text, Component component);

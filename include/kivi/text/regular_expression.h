@@ -13,9 +13,15 @@
 //
 // Malformed UTF-8 in the text or the pattern reads as U+FFFD; an embedded NUL
 // is an ordinary character. A pattern that does not compile gives nullptr and
-// an error; a search never fails loudly: a search that exhausts its step
-// budget or its backtracking memory (ICU's 8 MB default) finds nothing more,
-// and a text over 2 GiB (ICU's bound for UTF-8 input) finds nothing.
+// an error. A search that cannot finish (it exhausts its step budget or its
+// backtracking memory, ICU's 8 MB default, or the text is over 2 GiB, ICU's
+// bound for UTF-8 input) reports no further match and, when asked, an error
+// in RegularExpressionSearchErrorDomain, so that "stopped" never passes for
+// "no match":
+//
+//   auto runaway = kivi::RegularExpression::create("(a|aa)*c");
+//   runaway->firstMatch(std::string(64, 'a'), kivi::kWholeText, 10, &error);
+//   // std::nullopt, error->code() == kivi::RegularExpressionStepLimitError
 //
 // Thread contract: a compiled expression is immutable and may be used from any
 // number of threads at once; each search makes its own matcher.
@@ -59,12 +65,21 @@ inline constexpr RegularExpressionOptions RegularExpressionUseUnicodeWordBoundar
 // "NSCocoaErrorDomain"); the user info's "NSInvalidValue" holds the pattern.
 inline constexpr std::int64_t RegularExpressionInvalidPatternError = 2048;
 
+// The errors of a search that stopped before it could tell whether (more)
+// matches follow: its step budget ran out, its backtracking memory ran out,
+// or its text is over 2 GiB. The user info's NSDebugDescription says which.
+inline constexpr const char* RegularExpressionSearchErrorDomain =
+    "KivRegularExpressionSearchErrorDomain";
+inline constexpr std::int64_t RegularExpressionStepLimitError = 1;
+inline constexpr std::int64_t RegularExpressionBacktrackLimitError = 2;
+inline constexpr std::int64_t RegularExpressionTextTooLongError = 3;
+
 class RegularExpression {
  public:
   // Step budget of a search: 0 is unlimited. A step is ICU's unit of match
-  // work, roughly ten thousand engine operations (about a millisecond); the
-  // count is deterministic, not a clock. A search that runs out reports no
-  // (further) match.
+  // work, ten thousand saved backtracking states (0.2 to 1 ms); the count is
+  // deterministic, not a clock. A search that runs out reports no (further)
+  // match and RegularExpressionStepLimitError.
   using StepLimit = std::int32_t;
 
   // Nullptr, and *error (when given) set, if `pattern` does not compile.
@@ -79,20 +94,24 @@ class RegularExpression {
   const std::string& pattern() const noexcept { return pattern_; }
   RegularExpressionOptions options() const noexcept { return options_; }
 
+  // Each search sets *error (when given) on every call: nullptr when it ran
+  // to its end (or `visit` ended it), else the reason it stopped (see
+  // RegularExpressionSearchErrorDomain); what it found until then stands.
+
   // The leftmost match inside `range` of `text`. The range acts as the whole
   // text: "^", "$" and look-around stop at its ends. A range boundary inside
   // a multi-byte character cuts that character, which then reads as U+FFFD.
   std::optional<TextRange> firstMatch(std::string_view text, TextRange range = kWholeText,
-                                      StepLimit stepLimit = 0) const;
+                                      StepLimit stepLimit = 0, ErrorPtr* error = nullptr) const;
 
   // Calls `visit` with each non-overlapping match in order until it returns
   // false; returns the number of matches visited.
   std::size_t enumerateMatches(std::string_view text, TextRange range,
-                               const std::function<bool(TextRange)>& visit,
-                               StepLimit stepLimit = 0) const;
+                               const std::function<bool(TextRange)>& visit, StepLimit stepLimit = 0,
+                               ErrorPtr* error = nullptr) const;
 
   std::size_t numberOfMatches(std::string_view text, TextRange range = kWholeText,
-                              StepLimit stepLimit = 0) const;
+                              StepLimit stepLimit = 0, ErrorPtr* error = nullptr) const;
 
  private:
   struct Compiled;

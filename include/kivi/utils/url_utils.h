@@ -42,14 +42,17 @@ namespace kivi {
 
 namespace KiviOSSdkUtils {
 // Appends `items` to the query items of `components`, in order, keeping the
-// existing ones (names are never merged). An empty `items` changes nothing,
-// not even an empty query.
+// existing ones as they are written (names are never merged; an existing
+// value that does not decode keeps its text). An empty `items` changes
+// nothing, not even an empty query.
 void addQueryItems(URLComponents& components, const std::vector<URLQueryItem>& items);
 }  // namespace KiviOSSdkUtils
 
 // The items of `queryString` (the text after "?") that have a value (an empty
-// one counts; a bare name does not), decoded; "+" stays "+". A name given
-// more than once keeps its last value. Empty when the text is not a query.
+// one counts; a bare name does not, nor does a value whose decoded bytes are
+// not UTF-8), decoded; "+" stays "+"; a name that is not UTF-8 decoded is
+// listed as "". A name given more than once keeps its last value. Empty when
+// the text is not a query.
 std::map<std::string, std::string> getQueryItemsDictionary(std::string_view queryString);
 
 namespace CustomHeaders {
