@@ -115,6 +115,7 @@ concurrency_targets() {
 
 # --- 1. Normal build ---------------------------------------------------------
 begin_stage "1/4 normal build (build/, RelWithDebInfo)"
+bash scripts/check_layers.sh || fail "a layer includes from a layer above it"
 configure build -DCMAKE_BUILD_TYPE=RelWithDebInfo
 build build
 run_ctest build
