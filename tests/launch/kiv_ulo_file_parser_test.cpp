@@ -18,8 +18,9 @@ using std::nullopt;
 // A launch file of the usual size and shape (about 1.7 KB), "FullScreen" last.
 std::string launchFile() {
   std::string text = "[Launch]\r\n";
-  for (int i = 0; i < 40; ++i) {
-    text += "Setting" + std::to_string(i) + "=s:value of setting " + std::to_string(i) + "\r\n";
+  for (int i = 0; i < 24; ++i) {
+    text += "Setting" + std::to_string(i) +
+            "=s:C:\\Program Files\\Vendor\\Client\\client.exe /arg " + std::to_string(i) + "\r\n";
   }
   return text + "FullScreen=Yes\r\n";
 }
