@@ -52,9 +52,23 @@ bool kept(const std::string& name, const std::vector<std::string>& keep) {
 std::optional<std::string> KivSdkURLForLogging(const URLPtr& url) {
   if (!url) return std::nullopt;
   URLComponents components = URLComponents::fromURL(*url);
-  auto items = components.queryItems().value_or(std::vector<URLQueryItem>{});
-  for (URLQueryItem& item : items) item.value = masked(item.value.value_or(""));
-  components.setQueryItems(items.empty() ? std::nullopt : std::optional(std::move(items)));
+  // Values are masked by what is written, so that one that does not decode
+  // (not UTF-8) is masked like any other; names stay as written.
+  std::optional<std::string> query;
+  if (const auto& written = components.percentEncodedQuery(); written && !written->empty()) {
+    query.emplace();
+    for (std::string_view rest = *written;;) {
+      const std::size_t amp = rest.find('&');
+      const std::string_view piece = rest.substr(0, amp);
+      const std::size_t equals = piece.find('=');
+      const bool secret = equals != std::string_view::npos && equals + 1 < piece.size();
+      query->append(piece.substr(0, equals)).append("=").append(secret ? kMask : "");
+      if (amp == std::string_view::npos) break;
+      query->push_back('&');
+      rest.remove_prefix(amp + 1);
+    }
+  }
+  components.setPercentEncodedQuery(query);
   const auto text = components.string();
   if (!text) return std::nullopt;
   auto decoded = percent_encoding::decode(*text);

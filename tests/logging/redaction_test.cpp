@@ -30,7 +30,8 @@ TEST(URLForLoggingTest, MasksQueryValuesAndDecodesTheWholeURL) {
        "https://u:pw@h:8080/a b/é?n m=***#x/y"},
       {"https://h/?a%26b%3D=1&%2B", "https://h/?a&b==***&+="},
       {"https://h/p?", "https://h/p"},
-      {"https://h/%FF?a=1", nullopt},  // not UTF-8 once decoded
+      {"https://h/%FF?a=1", nullopt},                             // not UTF-8 once decoded
+      {"https://h/p?a=%E9&b=%c3%a9", "https://h/p?a=***&b=***"},  // masked, decodable or not
   };
   for (const auto& row : cases) {
     EXPECT_EQ(KivSdkURLForLogging(URL::URLWithString(row.url)), row.expected) << row.url;
