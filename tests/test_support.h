@@ -2,6 +2,8 @@
 // on its result, so that a hang becomes a failure rather than a stuck run.
 #pragma once
 
+#include <dirent.h>
+
 #include <chrono>
 #include <condition_variable>
 #include <cstddef>
@@ -26,6 +28,16 @@ namespace testing {
 inline constexpr std::chrono::milliseconds kTimeout = std::chrono::seconds(10);
 // How long a test watches for something that must not happen.
 inline constexpr std::chrono::milliseconds kQuiet{50};
+
+// Descriptors this process holds open right now.
+inline std::size_t openDescriptors() {
+  std::size_t count = 0;
+  if (DIR* dir = ::opendir("/proc/self/fd")) {
+    while (::readdir(dir)) ++count;
+    ::closedir(dir);
+  }
+  return count;
+}
 
 // Counts notify() calls from any thread; wait(n) waits until n have been made.
 class Signal {

@@ -1,6 +1,5 @@
 // Around the whole network suite: every descriptor its tests open (sessions,
 // connections, servers) is closed again by the end.
-#include <dirent.h>
 #include <gtest/gtest.h>
 
 #include <chrono>
@@ -8,18 +7,12 @@
 
 #include "kivi/dispatch/dispatch_clock.h"
 #include "kivi/net/url_session.h"
+#include "test_support.h"
 
 namespace kivi {
 namespace {
 
-std::size_t openDescriptors() {
-  std::size_t count = 0;
-  if (DIR* dir = ::opendir("/proc/self/fd")) {
-    while (::readdir(dir)) ++count;
-    ::closedir(dir);
-  }
-  return count;
-}
+using testing::openDescriptors;
 
 class DescriptorCheck : public ::testing::Environment {
  public:

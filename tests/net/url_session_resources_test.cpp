@@ -1,5 +1,4 @@
 // What a session holds on to: descriptors, connections, memory for a body.
-#include <dirent.h>
 #include <gtest/gtest.h>
 
 #include <atomic>
@@ -13,18 +12,10 @@
 namespace kivi {
 namespace {
 
+using testing::openDescriptors;
 using testing::RawConnection;
 using testing::RawServer;
 using testing::Signal;
-
-std::size_t openDescriptors() {
-  std::size_t count = 0;
-  if (DIR* dir = ::opendir("/proc/self/fd")) {
-    while (::readdir(dir)) ++count;
-    ::closedir(dir);
-  }
-  return count;
-}
 
 // The count once it has stopped changing.
 std::size_t settledDescriptors() {
