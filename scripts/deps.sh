@@ -10,6 +10,8 @@ set -euo pipefail
 #   libclang-rt-14-dev: libFuzzer and the sanitizer runtimes for clang.
 #   nginx, openssl: a real HTTPS and HTTP/2 server for the network tests,
 #   started by the tests themselves on 127.0.0.1 (never as a service).
+#   libglib2.0-dev: the GLib main loop that the host-loop test drives the main
+#   run loop from, as a GTK application would.
 PACKAGES=(
   cmake
   ninja-build
@@ -29,6 +31,7 @@ PACKAGES=(
   libcpp-httplib-dev
   nginx
   openssl
+  libglib2.0-dev
 )
 
 # Prints the packages among the arguments that are not installed.

@@ -1,6 +1,7 @@
 #include "kivi/base/value.h"
 
 #include <charconv>
+#include <chrono>
 #include <cmath>
 #include <limits>
 #include <tuple>
@@ -10,6 +11,11 @@
 #include "kivi/base/object.h"
 
 namespace kivi {
+
+Date Date::now() noexcept {
+  const auto since = std::chrono::system_clock::now().time_since_epoch();
+  return Date{std::chrono::duration<double>(since).count()};
+}
 
 bool Number::boolValue() const noexcept {
   switch (type_) {

@@ -12,8 +12,12 @@
 #include <thread>
 #include <vector>
 
+#include "kivi/dispatch/detail/main_queue.h"
 #include "kivi/dispatch/detail/thread_start.h"
 #include "kivi/dispatch/dispatch_clock.h"
+#include "kivi/dispatch/dispatch_group.h"
+#include "kivi/dispatch/dispatch_work_item.h"
+#include "kivi/dispatch/thread.h"
 #include "kivi/dispatch/worker_pool.h"
 #include "test_support.h"
 
@@ -263,6 +267,252 @@ TEST(DispatchClock, SystemClockRunsWorkAfterItsDeadline) {
   }
   EXPECT_TRUE(done->wait(kCount));
   EXPECT_EQ(early, 0);
+}
+
+// Barriers on a private concurrent queue, given from several threads at once
+// (async, async with a barrier work item, sync with one): a barrier starts
+// only after everything its thread gave before it has finished, runs with
+// nothing else of the queue, and what its thread gives after it starts only
+// once it is done. Ordinary work still runs side by side.
+TEST(DispatchQueue, BarriersOnAConcurrentQueueRunAloneBetweenEarlierAndLaterWork) {
+  auto queue = DispatchQueue::create("kivi.tests.barrier", DispatchQueue::Attributes::concurrent);
+  constexpr int kThreads = 4, kItems = 400;
+  struct Track {
+    std::atomic<bool> started{false}, finished{false};
+  };
+  std::vector<std::vector<Track>> track(kThreads);
+  for (auto& items : track) items = std::vector<Track>(kItems);
+  std::atomic<int> ordinaryInside{0}, barriersInside{0}, faults{0}, ran{0};
+  auto ordinary = [&](int t, int i) {
+    return [&, t, i] {
+      ordinaryInside.fetch_add(1);
+      track[t][i].started = true;
+      if (barriersInside.load() != 0 || !queue->isCurrent()) ++faults;
+      for (int k = 0; k < 20; ++k) std::this_thread::yield();  // a little work
+      ordinaryInside.fetch_sub(1);
+      track[t][i].finished = true;
+      ++ran;
+    };
+  };
+  auto barrier = [&](int t, int i) {
+    return [&, t, i] {
+      if (barriersInside.fetch_add(1) != 0 || ordinaryInside.load() != 0) ++faults;
+      track[t][i].started = true;
+      for (int k = 0; k < kItems; ++k) {
+        if (k < i && !track[t][k].finished) ++faults;
+        if (k > i && track[t][k].started) ++faults;
+      }
+      barriersInside.fetch_sub(1);
+      track[t][i].finished = true;
+      ++ran;
+    };
+  };
+  std::vector<std::thread> submitters;
+  for (int t = 0; t < kThreads; ++t) {
+    submitters.emplace_back([&, t] {
+      for (int i = 0; i < kItems; ++i) {
+        if (i % 37 != 36) {
+          queue->async(ordinary(t, i));
+        } else if (t == 0) {
+          queue->sync(
+              std::make_shared<DispatchWorkItem>(DispatchWorkItemFlags::barrier, barrier(t, i)));
+          if (!track[t][i].finished) ++faults;
+        } else if (t == 1) {
+          queue->async(
+              std::make_shared<DispatchWorkItem>(DispatchWorkItemFlags::barrier, barrier(t, i)));
+        } else {
+          queue->async(nullptr, {}, DispatchWorkItemFlags::barrier, barrier(t, i));
+        }
+      }
+    });
+  }
+  for (auto& thread : submitters) thread.join();
+  auto done = std::make_shared<Signal>();
+  queue->async(DispatchWorkItemFlags::barrier, [done] { done->notify(); });
+  ASSERT_TRUE(done->wait());
+  EXPECT_EQ(ran, kThreads * kItems);  // with the final barrier, after everything
+  EXPECT_EQ(faults, 0);
+
+  // Between barriers, ordinary work overlaps; a released queue still runs
+  // what it was given.
+  auto both = std::make_shared<Signal>(), after = std::make_shared<Signal>();
+  queue->async(DispatchWorkItemFlags::barrier, [] {});
+  for (int i = 0; i < 2; ++i) {
+    queue->async([both] {
+      both->notify();
+      EXPECT_TRUE(both->wait(2));
+    });
+  }
+  queue->async(DispatchWorkItemFlags::barrier, [after] { after->notify(); });
+  queue.reset();
+  EXPECT_TRUE(after->wait());
+}
+
+// A group waits for many items on several queues, also from workers of the
+// pool (which count as blocked meanwhile); notify() runs once, after all of
+// them; a leave() without an enter() leaves the count alone.
+TEST(DispatchGroup, WaitAndNotifyFollowEveryItemAndTimeOuts) {
+  auto group = std::make_shared<DispatchGroup>();
+  EXPECT_EQ(group->wait(DispatchTime::min()), DispatchTimeoutResult::success);  // empty
+  auto gate = std::make_shared<Signal>();
+  auto serial = DispatchQueue::create("kivi.tests.group");
+  constexpr int kItems = 1000;
+  std::atomic<int> ran{0};
+  group->enter();
+  DispatchQueue::global(DispatchQoS::QoSClass::utility)->async([group, gate, &ran] {
+    EXPECT_TRUE(gate->wait());
+    ++ran;
+    group->leave();
+  });
+  for (int i = 1; i < kItems; ++i) {
+    if (i % 2) {
+      DispatchQueue::global()->async(group, [&ran] { ++ran; });
+    } else {
+      serial->async(group, std::make_shared<DispatchWorkItem>([&ran] { ++ran; }));
+    }
+  }
+  auto notified = std::make_shared<Signal>();
+  std::atomic<int> ranAtNotify{-1};
+  group->notify(serial, [&] {
+    ranAtNotify = ran.load();
+    notified->notify();
+  });
+  const auto start = std::chrono::steady_clock::now();
+  EXPECT_EQ(group->wait(start + milliseconds(30)), DispatchTimeoutResult::timedOut);
+  EXPECT_GE(std::chrono::steady_clock::now() - start, milliseconds(30));
+  const int waiters = static_cast<int>(WorkerPool::shared().width()) + 1;
+  auto waited = std::make_shared<Signal>();
+  for (int i = 0; i < waiters; ++i) {
+    WorkerPool::shared().submit([group, waited] {
+      group->wait();
+      waited->notify();
+    });
+  }
+  const auto deadline = std::chrono::steady_clock::now() + testing::kTimeout;
+  while (WorkerPool::shared().statistics().blocked < static_cast<std::size_t>(waiters) &&
+         std::chrono::steady_clock::now() < deadline) {
+    std::this_thread::sleep_for(milliseconds(1));
+  }
+  EXPECT_GE(WorkerPool::shared().statistics().blocked, static_cast<std::size_t>(waiters));
+  EXPECT_FALSE(notified->wait(1, testing::kQuiet));
+  gate->notify();
+  EXPECT_EQ(group->wait(std::chrono::steady_clock::now() + testing::kTimeout),
+            DispatchTimeoutResult::success);
+  EXPECT_TRUE(waited->wait(waiters));
+  ASSERT_TRUE(notified->wait());
+  EXPECT_EQ(ranAtNotify, kItems);
+  serial->sync([] {});
+  EXPECT_FALSE(notified->wait(2, testing::kQuiet));  // once
+
+  group->leave();  // unmatched: ignored
+  group->enter();
+  auto second = std::make_shared<Signal>();
+  group->notify(serial, [second] { second->notify(); });
+  EXPECT_FALSE(second->wait(1, testing::kQuiet));
+  group->leave();
+  EXPECT_TRUE(second->wait());
+  group->notify(serial, [second] { second->notify(); });  // empty: at once
+  EXPECT_TRUE(second->wait(2));
+  EXPECT_TRUE(poolSettles());
+}
+
+// A work item cancelled before its turn never runs, yet counts as done when
+// the queue gets to it; notify() fires once, or at once after that.
+TEST(DispatchWorkItem, CancelBeforeRunAndNotify) {
+  auto queue = DispatchQueue::create("kivi.tests.item");
+  auto gate = std::make_shared<Signal>();
+  queue->async([gate] { EXPECT_TRUE(gate->wait()); });
+  std::atomic<int> ran{0};
+  auto cancelled = std::make_shared<DispatchWorkItem>([&ran] { ++ran; });
+  auto kept = std::make_shared<DispatchWorkItem>(DispatchQoS::utility, DispatchWorkItemFlags{},
+                                                 [&ran] { ran += 10; });
+  EXPECT_EQ(kept->qos(), DispatchQoS::utility);
+  auto notified = std::make_shared<Signal>();
+  cancelled->notify(queue, [notified] { notified->notify(); });
+  kept->notify(queue, [notified] { notified->notify(); });
+  queue->async(cancelled);
+  queue->asyncAfter(DispatchClock::system()->now() + milliseconds(1), kept);
+  cancelled->cancel();
+  EXPECT_TRUE(cancelled->isCancelled());
+  EXPECT_EQ(cancelled->wait(std::chrono::steady_clock::now() + testing::kQuiet),
+            DispatchTimeoutResult::timedOut);
+  EXPECT_FALSE(notified->wait(1, testing::kQuiet));
+  gate->notify();
+  cancelled->wait();
+  EXPECT_EQ(kept->wait(std::chrono::steady_clock::now() + testing::kTimeout),
+            DispatchTimeoutResult::success);
+  EXPECT_TRUE(notified->wait(2));
+  EXPECT_EQ(ran, 10);
+  kept->perform();  // runs again; its notify does not
+  EXPECT_EQ(ran, 20);
+  kept->notify(queue, [notified] { notified->notify(); });  // done: at once
+  EXPECT_TRUE(notified->wait(3));
+  queue->sync([] {});
+  EXPECT_FALSE(notified->wait(4, testing::kQuiet));
+}
+
+// The main queue runs on the main thread when it is drained, in order; work
+// added by a drain waits for the next. sync() onto it from the main thread
+// runs at once, from a worker once the main thread has drained.
+TEST(DispatchQueue, MainQueueRunsOnTheMainThreadWhenDrained) {
+  ASSERT_TRUE(Thread::isMainThread());
+  const auto& main = DispatchQueue::main();
+  EXPECT_TRUE(main->isSerial());
+  EXPECT_TRUE(main->isCurrent());
+  while (detail::drainMainQueue()) {
+  }
+  std::vector<int> order;
+  main->async([&] {
+    order.push_back(1);
+    main->async([&] { order.push_back(3); });
+  });
+  main->async([&] { order.push_back(2); });
+  bool inline_ = false;
+  main->sync([&] { inline_ = true; });
+  EXPECT_TRUE(inline_);
+  EXPECT_TRUE(order.empty());
+  EXPECT_TRUE(detail::drainMainQueue());
+  EXPECT_EQ(order, (std::vector<int>{1, 2}));
+  EXPECT_TRUE(detail::drainMainQueue());
+  EXPECT_EQ(order, (std::vector<int>{1, 2, 3}));
+  EXPECT_FALSE(detail::drainMainQueue());
+
+  std::atomic<bool> onMain{false}, returned{false};
+  WorkerPool::shared().submit([&] {
+    main->sync(std::make_shared<DispatchWorkItem>([&] { onMain = Thread::isMainThread(); }));
+    returned = true;
+  });
+  std::thread([] { EXPECT_FALSE(detail::drainMainQueue()); }).join();  // not the main thread
+  const auto deadline = std::chrono::steady_clock::now() + testing::kTimeout;
+  while (!returned && std::chrono::steady_clock::now() < deadline) {
+    detail::drainMainQueue();
+    std::this_thread::yield();
+  }
+  EXPECT_TRUE(returned);
+  EXPECT_TRUE(onMain);
+}
+
+// One global queue per class, reporting its class; an unspecified class is
+// the default one.
+TEST(DispatchQueue, GlobalQueuesByQualityOfService) {
+  using QoSClass = DispatchQoS::QoSClass;
+  const auto& user = DispatchQueue::global(QoSClass::userInteractive);
+  EXPECT_EQ(user, DispatchQueue::global(QoSClass::userInteractive));
+  EXPECT_NE(user, DispatchQueue::global(QoSClass::background));
+  EXPECT_EQ(user->qos().qosClass, QoSClass::userInteractive);
+  EXPECT_EQ(DispatchQueue::global(QoSClass::unspecified), DispatchQueue::global());
+  EXPECT_EQ(DispatchQueue::global()->qos(), DispatchQoS::default_);
+  EXPECT_EQ(KivDispatchQueueProtocol::global(QoSClass::utility),
+            DispatchQueue::global(QoSClass::utility));
+  EXPECT_FALSE(user->isSerial());
+  EXPECT_EQ(DispatchQoS(QoSClass::utility, -40).relativePriority, -15);
+  auto ran = std::make_shared<Signal>();
+  user->async([ran, &user] {
+    EXPECT_TRUE(user->isCurrent());
+    EXPECT_FALSE(DispatchQueue::global(DispatchQoS::QoSClass::background)->isCurrent());
+    ran->notify();
+  });
+  EXPECT_TRUE(ran->wait());
 }
 
 }  // namespace

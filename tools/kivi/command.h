@@ -31,7 +31,7 @@ struct CommandRegistration {
   CommandRegistration(int order, Command (*factory)());
 };
 
-// Whether `args` asks for help ("-h" or "--help" anywhere).
+// Whether `args` asks for help ("-h" or "--help" anywhere before a "--").
 bool wantsHelp(const std::vector<std::string>& args);
 
 }  // namespace kivi::tool

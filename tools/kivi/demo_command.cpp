@@ -13,13 +13,14 @@
 #include <thread>
 
 #include "command.h"
+#include "demo_timing.h"
 #include "kivi/base/error.h"
-#include "kivi/text/json_serialization.h"
-#include "kivi/net/url_session.h"
 #include "kivi/dispatch/worker_pool.h"
+#include "kivi/net/url_session.h"
 #include "kivi/operations/kiv_async_operation.h"
 #include "kivi/operations/kiv_async_service.h"
 #include "kivi/operations/kiv_json_api_operation.h"
+#include "kivi/text/json_serialization.h"
 
 namespace kivi::tool {
 
@@ -399,6 +400,7 @@ int runDemo(const std::vector<std::string>& args, std::ostream& out, std::ostrea
   workflows->operationQueue()->waitUntilAllOperationsAreFinished();
 
   if (int failed = runRestCalls(journal, *printer, err)) return failed;
+  if (int failed = runTimingDemo(out, err)) return failed;
 
   out << "\nParked workflows were released in this order:";
   for (const auto& name : released) out << " " << name;
@@ -421,7 +423,12 @@ Command demoCommand() {
           "Then starts a small JSON server on 127.0.0.1 (no outside network needed) and\n"
           "runs one REST call per atomic workflow against it, showing the statuses\n"
           "Success, Unauthorized, AccessDenied, InvalidContentType, InvalidServerResponse\n"
-          "and Cancelled (a request cancelled while the server holds it).\n",
+          "and Cancelled (a request cancelled while the server holds it).\n\n"
+          "Last, the timing primitives: a repeating KivTimer, a KivRunloopTimer that\n"
+          "fires only while the main run loop runs in its mode, a main-thread\n"
+          "KivRunLoopSemaphore wait during which main-queue work runs, a\n"
+          "KivKeyValueObserver reporting an operation's \"isFinished\" on a chosen\n"
+          "queue, and two `kivi lock` child processes taking turns on one lock.\n",
           runDemo};
 }
 

@@ -42,6 +42,7 @@ std::vector<Command> allCommands() {
 
 bool wantsHelp(const std::vector<std::string>& args) {
   for (const auto& a : args) {
+    if (a == "--") break;  // what follows belongs to another program
     if (a == "-h" || a == "--help") return true;
   }
   return false;

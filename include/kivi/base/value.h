@@ -62,6 +62,21 @@ using Dictionary = std::map<std::string, Value, std::less<>>;
 struct Date {
   double timeIntervalSince1970 = 0;
   friend auto operator<=>(const Date&, const Date&) = default;
+
+  // The wall clock now.
+  static Date now() noexcept;
+  // Far ahead of and far behind any real time (the years 4001 and 1 of the
+  // Gregorian calendar), for "no limit" and "already passed".
+  static constexpr Date distantFuture() noexcept { return Date{64092211200.0}; }
+  static constexpr Date distantPast() noexcept { return Date{-62135769600.0}; }
+  // This date plus `seconds`.
+  constexpr Date addingTimeInterval(double seconds) const noexcept {
+    return Date{timeIntervalSince1970 + seconds};
+  }
+  // Seconds from now to this date (negative when it has passed).
+  double timeIntervalSinceNow() const noexcept {
+    return timeIntervalSince1970 - now().timeIntervalSince1970;
+  }
 };
 
 // A number with the flavour it was made with (bool, signed, unsigned or

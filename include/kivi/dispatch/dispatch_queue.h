@@ -5,20 +5,49 @@
 // worker the pool gives it; sync() onto it waits for the earlier items, then
 // runs its work on the calling thread while the queue runs nothing else. A
 // concurrent queue hands each async() item to the pool at once, and sync()
-// onto it runs the work on the calling thread straight away. global() is the
-// process's concurrent queue.
+// onto it runs the work on the calling thread straight away (both wait while
+// a barrier is pending, see below).
 //
 //   auto queue = kivi::DispatchQueue::create("com.example.cache");
 //   queue->async([] { write(); });
 //   queue->sync([&] { value = read(); });   // after write()
 //   queue->asyncAfter(kivi::DispatchClock::system()->now() + 2s, [] { flush(); });
 //
+//   auto group = std::make_shared<kivi::DispatchGroup>();
+//   auto images = kivi::DispatchQueue::global(kivi::DispatchQoS::QoSClass::utility);
+//   for (auto& file : files) images->async(group, [&file] { decode(file); });
+//   group->wait();
+//
+// The queues of the process:
+//   - main(): the serial queue of the main thread. Its work runs on the main
+//     thread, in order, while the main run loop turns in a common mode (or a
+//     host loop asks the run loop to run what is pending); until then it
+//     waits. sync() onto it from the main thread runs the work at once, even
+//     with earlier work pending, since waiting there could never end; from
+//     any other thread it returns once the main thread has run the work.
+//   - global(qos): one concurrent queue per quality-of-service class, all on
+//     the same pool; qos() answers the class. global() is the default class's
+//     queue; an unspecified or unknown class also answers that one.
+//   - create(): a private queue of the caller, serial unless asked otherwise.
+//
+// A barrier (DispatchWorkItemFlags::barrier, on the work or on a work item)
+// given to a private concurrent queue waits until the work given before it
+// has finished, then runs alone; work given after it waits until it has run.
+// sync() with a barrier work item waits likewise and runs it on the caller.
+// On serial queues and on the global queues a barrier is ordinary work.
+// The quality of service given with work is accepted and not acted on.
+//
+// With a group, async() enters the group when it takes the work and leaves
+// it after the work has run. Work items run through perform(): a cancelled
+// one is dropped when its turn comes. Null work or a null work item does
+// nothing (a null group is no group).
+//
 // asyncAfter() keeps the queue alive until its work has been handed over; a
 // ManualClock given to it decides the time instead of the system clock.
 //
 // Thread contract: every member may be called from any thread. sync() blocks
-// the caller until its work has run (a waiting worker counts as blocked, so the
-// pool stays at its width). sync() onto a serial queue from work that queue is
+// the caller until its work has run (a waiting worker counts as blocked, so
+// the pool stays at its width). sync() onto a queue from work that queue is
 // running would wait for itself for ever; it runs the work at once instead.
 #pragma once
 
@@ -29,39 +58,68 @@
 
 #include "kivi/base/object.h"
 #include "kivi/dispatch/dispatch_clock.h"
+#include "kivi/dispatch/dispatch_group.h"
+#include "kivi/dispatch/dispatch_qos.h"
+#include "kivi/dispatch/dispatch_work_item.h"
+#include "kivi/dispatch/kiv_dispatch_queue_protocol.h"
 
 namespace kivi {
 
-class DispatchQueue : public Object {
+namespace detail {
+struct DispatchQueueCore;
+}  // namespace detail
+
+class DispatchQueue : public Object, public KivDispatchQueueProtocol {
  public:
   enum class Attributes : std::uint8_t { serial, concurrent };
 
   [[nodiscard]] static std::shared_ptr<DispatchQueue> create(
       std::string label, Attributes attributes = Attributes::serial);
-  // The process-wide concurrent queue.
+  [[nodiscard]] static std::shared_ptr<DispatchQueue> create(std::string label, DispatchQoS qos,
+                                                             Attributes attributes);
+  // The main thread's serial queue.
+  static const std::shared_ptr<DispatchQueue>& main();
+  // The process-wide concurrent queue of the default class.
   static const std::shared_ptr<DispatchQueue>& global();
+  // The process-wide concurrent queue of `qos`.
+  static const std::shared_ptr<DispatchQueue>& global(DispatchQoS::QoSClass qos);
   ~DispatchQueue() override;
 
   const std::string& label() const noexcept;
   bool isSerial() const noexcept;
+  DispatchQoS qos() const noexcept;
+
+  using KivDispatchQueueProtocol::async;
+  using KivDispatchQueueProtocol::asyncAfter;
+  using KivDispatchQueueProtocol::sync;
 
   void async(std::function<void()> work);
-  void sync(const std::function<void()>& work);
-  // Submits `work` with async() once `deadline` has passed on the clock.
+  void async(const DispatchGroupPtr& group, DispatchQoS qos, DispatchWorkItemFlags flags,
+             std::function<void()> work) override;
+  void async(const DispatchWorkItemPtr& workItem) override;
+  void async(const DispatchGroupPtr& group, const DispatchWorkItemPtr& workItem) override;
+
+  void sync(const std::function<void()>& work) override;
+  void sync(const DispatchWorkItemPtr& workItem) override;
+
+  // Submits the work with async() once `deadline` has passed on the clock.
   void asyncAfter(DispatchTime deadline, std::function<void()> work);
   void asyncAfter(DispatchClock& clock, DispatchTime deadline, std::function<void()> work);
+  void asyncAfter(DispatchTime deadline, DispatchQoS qos, DispatchWorkItemFlags flags,
+                  std::function<void()> work) override;
+  void asyncAfter(DispatchTime deadline, const DispatchWorkItemPtr& workItem) override;
 
   // Whether the calling thread is running work of this queue (also from
-  // inside a sync() onto another queue made by that work).
+  // inside a sync() onto another queue made by that work). For main(),
+  // whether the calling thread is the main thread.
   bool isCurrent() const noexcept;
 
   std::string className() const override;
   std::string description() const override;
 
  private:
-  struct Core;
-  DispatchQueue(std::string label, Attributes attributes);
-  std::shared_ptr<Core> core_;
+  explicit DispatchQueue(std::shared_ptr<detail::DispatchQueueCore> core);
+  std::shared_ptr<detail::DispatchQueueCore> core_;
 };
 
 using DispatchQueuePtr = std::shared_ptr<DispatchQueue>;

@@ -1,0 +1,68 @@
+// MockDispatchQueue: a scriptable KivDispatchQueueProtocol.
+//
+// Every operation calls the matching callback property, if set, with its
+// arguments unchanged, and does nothing otherwise: without a callback no
+// work runs, not even by sync(). The double keeps nothing it is given.
+//
+//   auto queue = std::make_shared<kivi::MockDispatchQueue>();
+//   queue->syncBlock = [](const std::function<void()>& work) { work(); };
+//   queue->asyncBlock = [&](const kivi::DispatchGroupPtr&, kivi::DispatchQoS,
+//                           kivi::DispatchWorkItemFlags, std::function<void()> work) {
+//     pending.push_back(std::move(work));  // the test runs it when it likes
+//   };
+//   cache.setQueue(queue);
+//
+// global(qos) is static, like the operation it stands in for: it makes a new
+// real serial queue labelled "MockQueue"; when the class-level
+// globalQueuewithQOSBlock is set, that queue is dropped and the callback's
+// answer for `qos` is returned instead.
+//
+// Thread contract: none; callbacks run synchronously on the calling thread.
+// Set the callbacks before handing the double out. globalQueuewithQOSBlock
+// is shared by the whole process: a test that sets it resets it.
+#pragma once
+
+#include <functional>
+#include <memory>
+
+#include "kivi/base/object.h"
+#include "kivi/dispatch/dispatch_queue.h"
+#include "kivi/dispatch/kiv_dispatch_queue_protocol.h"
+
+namespace kivi {
+
+class MockDispatchQueue : public Object, public KivDispatchQueueProtocol {
+ public:
+  MockDispatchQueue() = default;
+
+  std::function<void(const DispatchGroupPtr&, DispatchQoS, DispatchWorkItemFlags,
+                     std::function<void()>)>
+      asyncBlock;
+  std::function<void(const DispatchGroupPtr&, const DispatchWorkItemPtr&)> asyncWithGroupBlock;
+  std::function<void(const DispatchWorkItemPtr&)> asyncWithWorkItemBlock;
+  std::function<void(DispatchTime, DispatchQoS, DispatchWorkItemFlags, std::function<void()>)>
+      asyncAfterBlock;
+  std::function<void(DispatchTime, const DispatchWorkItemPtr&)> asyncAfterWithWorkItemBlock;
+  std::function<void(const DispatchWorkItemPtr&)> syncWithWorkItemBlock;
+  std::function<void(const std::function<void()>&)> syncBlock;
+  // Class-level: answers global(qos) for every MockDispatchQueue user.
+  static std::function<DispatchQueuePtr(DispatchQoS::QoSClass)> globalQueuewithQOSBlock;
+
+  static DispatchQueuePtr global(DispatchQoS::QoSClass qos);
+
+  using KivDispatchQueueProtocol::async;
+  using KivDispatchQueueProtocol::asyncAfter;
+  using KivDispatchQueueProtocol::sync;
+
+  void async(const DispatchGroupPtr& group, DispatchQoS qos, DispatchWorkItemFlags flags,
+             std::function<void()> work) override;
+  void sync(const DispatchWorkItemPtr& workItem) override;
+  void async(const DispatchWorkItemPtr& workItem) override;
+  void async(const DispatchGroupPtr& group, const DispatchWorkItemPtr& workItem) override;
+  void asyncAfter(DispatchTime deadline, DispatchQoS qos, DispatchWorkItemFlags flags,
+                  std::function<void()> work) override;
+  void asyncAfter(DispatchTime deadline, const DispatchWorkItemPtr& workItem) override;
+  void sync(const std::function<void()>& work) override;
+};
+
+}  // namespace kivi

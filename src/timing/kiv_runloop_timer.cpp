@@ -1,0 +1,86 @@
+#include "kivi/timing/kiv_runloop_timer.h"
+
+#include <utility>
+
+namespace kivi {
+
+KivRunloopTimer::KivRunloopTimer(double timeInterval, RunLoopMode runloopMode,
+                                 KivTimerDisposition disposition, TimerBlock block)
+    : timeInterval_(timeInterval),
+      runloopMode_(std::move(runloopMode)),
+      timerBlock_(std::move(block)),
+      timerDisposition_(disposition),
+      operationQueue_(std::make_shared<OperationQueue>()) {
+  operationQueue_->setMaxConcurrentOperationCount(1);
+}
+
+std::shared_ptr<KivRunloopTimer> KivRunloopTimer::create(double timeInterval,
+                                                         RunLoopMode runloopMode,
+                                                         KivTimerDisposition disposition,
+                                                         TimerBlock block) {
+  auto timer = std::make_shared<KivRunloopTimer>(timeInterval, std::move(runloopMode), disposition,
+                                                 std::move(block));
+  timer->operationQueue_->setName("com.zorvik.KivRunloopTimer " + timer->description());
+  return timer;
+}
+
+KivRunloopTimer::~KivRunloopTimer() {
+  // An armed run-loop timer would hold this object; only a spent or never
+  // started one can be left here.
+  if (timer_) timer_->invalidate();
+}
+
+void KivRunloopTimer::start() {
+  std::lock_guard lock(monitor_);
+  stopTimer();
+  auto self = std::static_pointer_cast<KivRunloopTimer>(shared_from_this());
+  // The run-loop timer holds its target until it is invalidated.
+  timer_ = Timer::create(
+      timeInterval_, [self](const TimerPtr& timer) { self->onTimerTriggered(timer); }, Value(),
+      timerDisposition_ == KivTimerDispositionRepeating);
+  RunLoop::mainRunLoop()->addTimer(timer_, runloopMode_);
+}
+
+void KivRunloopTimer::cancel() { stopTimer(); }
+
+void KivRunloopTimer::stopTimer() {
+  // The run-loop timer may hold the last reference to this object: keep it
+  // until the monitor is released.
+  const auto keep = weak_from_this().lock();
+  std::lock_guard lock(monitor_);
+  if (timer_ && timer_->isValid()) timer_->invalidate();
+  timer_.reset();
+}
+
+void KivRunloopTimer::onTimerTriggered(const TimerPtr&) {
+  auto strong = std::static_pointer_cast<KivRunloopTimer>(shared_from_this());
+  std::weak_ptr<KivRunloopTimer> weak = strong;
+  // The job keeps the timer alive until it has run.
+  operationQueue_->addOperation(std::make_shared<BlockOperation>([strong, weak] {
+    if (auto self = weak.lock()) {
+      if (auto block = self->timerBlock()) block(self);
+    }
+  }));
+}
+
+TimerPtr KivRunloopTimer::timer() const {
+  std::lock_guard lock(monitor_);
+  return timer_;
+}
+
+void KivRunloopTimer::setTimer(TimerPtr timer) {
+  std::lock_guard lock(monitor_);
+  timer_ = std::move(timer);
+}
+
+KivRunloopTimer::TimerBlock KivRunloopTimer::timerBlock() const {
+  std::lock_guard lock(monitor_);
+  return timerBlock_;
+}
+
+void KivRunloopTimer::setTimerBlock(TimerBlock block) {
+  std::lock_guard lock(monitor_);
+  timerBlock_ = std::move(block);
+}
+
+}  // namespace kivi
