@@ -176,16 +176,26 @@ struct DispatchQueueCore : std::enable_shared_from_this<DispatchQueueCore> {
     handoff->await();  // given once the main thread has run the work
   }
 
+  // Runs the items present when the call began, taken one at a time from
+  // the queue itself: a run of the main loop nested in an item (a semaphore
+  // wait) continues with the next item in order instead of skipping ahead.
   bool drainMain() {
-    std::deque<Item> batch;
+    std::size_t count = 0;
     {
       std::lock_guard lock(mutex);
-      batch.swap(items);
+      count = items.size();
       owned = false;  // work added from now on is announced again
     }
-    if (batch.empty()) return false;
+    if (count == 0) return false;
     RunningScope running(this);
-    for (Item& item : batch) {
+    for (std::size_t i = 0; i < count; ++i) {
+      Item item;
+      {
+        std::lock_guard lock(mutex);
+        if (items.empty()) break;  // a nested drain ran the rest
+        item = std::move(items.front());
+        items.pop_front();
+      }
       item.work();
       if (item.handoff) item.handoff->give();
     }

@@ -67,14 +67,13 @@ struct RunLoop::Core : std::enable_shared_from_this<RunLoop::Core> {
     }
   }
 
-  // Empties the descriptor before the work is looked at. The flag is
-  // cleared only after the read: a poster that still saw it set skipped its
-  // write, and its work (added before) is seen by the caller's look that
-  // follows; a poster that sees it cleared writes again. (Clearing the flag
-  // first would let this read swallow a write whose flag stays set, and the
-  // next poster would write nothing while the loop waits.)
+  // Empties the descriptor before the work is looked at, then clears the
+  // flag: a poster that still saw it set skipped its write, and its work
+  // (added before) is seen by the caller's look that follows; a poster that
+  // sees it cleared writes again. The read is unconditional, so a write that
+  // lands after an earlier clear never leaves the descriptor readable for
+  // good.
   void clearSignal() {
-    if (!fdSignalled.load(std::memory_order_acquire)) return;
     std::uint64_t value;
     while (::read(fd, &value, sizeof value) < 0 && errno == EINTR) {
     }
@@ -147,10 +146,12 @@ struct RunLoop::Core : std::enable_shared_from_this<RunLoop::Core> {
       std::lock_guard timerLock(core.mutex);
       if (!core.valid) return;
       const auto self = weak_from_this();
-      const bool known = std::any_of(core.loops.begin(), core.loops.end(), [&](const auto& loop) {
-        return !loop.owner_before(self) && !self.owner_before(loop);
-      });
-      if (!known) core.loops.push_back(self);
+      // A timer belongs to one run loop (in as many of its modes as asked).
+      for (const auto& loop : core.loops) {
+        const bool same = !loop.owner_before(self) && !self.owner_before(loop);
+        if (!same && !loop.expired()) return;
+      }
+      if (core.loops.empty() || core.loops.front().expired()) core.loops.assign(1, self);
     }
     std::lock_guard lock(mutex);
     auto& list = timers[mode];
@@ -247,6 +248,10 @@ struct RunLoop::Core : std::enable_shared_from_this<RunLoop::Core> {
         auto next = core.due + core.interval;
         if (next <= now) next += ((now - next) / core.interval + 1) * core.interval;
         core.due = next;
+      } else {
+        // Spent before its block runs: a run nested in the block must not
+        // fire it again.
+        core.due = DispatchTime::max();
       }
       block = core.block;
     }
@@ -286,9 +291,17 @@ struct RunLoop::Core : std::enable_shared_from_this<RunLoop::Core> {
       if (DispatchClock::system()->now() >= deadline) break;
       waitUntil(deadline);
     }
-    std::lock_guard lock(mutex);
-    modeStack.pop_back();
-    rearmLocked();
+    bool lookAgain = false;
+    {
+      std::lock_guard lock(mutex);
+      modeStack.pop_back();
+      rearmLocked();
+      // This run may have taken the descriptor's wake-up for work of the
+      // mode that resumes now (an outer run's, or the host's default mode):
+      // main-queue work it did not run, or blocks of that mode.
+      lookAgain = !modeStack.empty() || (isMain && !isCommonMode(mode));
+    }
+    if (lookAgain) signal();
     return true;
   }
 };
@@ -382,9 +395,14 @@ void RunLoop::runPendingWork() {
     core_->runner = std::this_thread::get_id();
   }
   core_->pass(NSDefaultRunLoopMode);
-  std::lock_guard lock(core_->mutex);
-  core_->modeStack.pop_back();
-  core_->rearmLocked();
+  bool nested = false;
+  {
+    std::lock_guard lock(core_->mutex);
+    core_->modeStack.pop_back();
+    core_->rearmLocked();
+    nested = !core_->modeStack.empty();
+  }
+  if (nested) core_->signal();
 }
 
 std::string RunLoop::className() const { return "NSRunLoop"; }

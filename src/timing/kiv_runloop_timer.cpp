@@ -31,9 +31,13 @@ KivRunloopTimer::~KivRunloopTimer() {
 }
 
 void KivRunloopTimer::start() {
+  auto self = std::static_pointer_cast<KivRunloopTimer>(weak_from_this().lock());
+  if (!self) return;  // not owned by a shared_ptr: nothing may hold it
   std::lock_guard lock(monitor_);
   stopTimer();
-  auto self = std::static_pointer_cast<KivRunloopTimer>(shared_from_this());
+  // The main run loop refuses an empty mode; a timer armed for it would hold
+  // this object for good without ever firing.
+  if (runloopMode_.empty()) return;
   // The run-loop timer holds its target until it is invalidated.
   timer_ = Timer::create(
       timeInterval_, [self](const TimerPtr& timer) { self->onTimerTriggered(timer); }, Value(),
@@ -53,7 +57,8 @@ void KivRunloopTimer::stopTimer() {
 }
 
 void KivRunloopTimer::onTimerTriggered(const TimerPtr&) {
-  auto strong = std::static_pointer_cast<KivRunloopTimer>(shared_from_this());
+  auto strong = std::static_pointer_cast<KivRunloopTimer>(weak_from_this().lock());
+  if (!strong) return;
   std::weak_ptr<KivRunloopTimer> weak = strong;
   // The job keeps the timer alive until it has run.
   operationQueue_->addOperation(std::make_shared<BlockOperation>([strong, weak] {

@@ -160,6 +160,18 @@ TEST(RunLoopTest, ATimerHoldsItsBlockUntilItIsDone) {
     loop->runUntilDate(in(5));
     EXPECT_EQ(fired, 1);
     EXPECT_TRUE(captured.expired()) << "a one-shot timer is invalidated after it fires";
+
+    // A run nested in a one-shot timer's block does not fire it again.
+    fired = 0;
+    loop->addTimer(Timer::create(0.001, false,
+                                 [&](const TimerPtr&) {
+                                   ++fired;
+                                   loop->runUntilDate(in(0.02));
+                                 }),
+                   NSDefaultRunLoopMode);
+    loop->addTimer(Timer::create(0.01, false, nullptr), NSDefaultRunLoopMode);  // keeps it busy
+    loop->runUntilDate(in(5));
+    EXPECT_EQ(fired, 1);
   });
 }
 
@@ -247,6 +259,20 @@ TEST(MainRunLoopTest, AHostLoopDrivesItThroughItsDescriptor) {
   EXPECT_FALSE(readable(fd, 50));
   EXPECT_TRUE(loop->runMode("modal", Date::distantPast()));
   EXPECT_EQ(fired, 11);
+
+  // Main-queue work announced while the loop ran another mode is still
+  // announced to the host afterwards.
+  loop->runPendingWork();
+  bool ran = false;
+  loop->addTimer(Timer::create(0.01, false, nullptr), "modal");
+  loop->performInModes({"modal"}, [&] {
+    std::thread([&] { DispatchQueue::main()->async([&] { ran = true; }); }).join();
+  });
+  EXPECT_TRUE(loop->runMode("modal", Date::now().addingTimeInterval(5)));
+  EXPECT_FALSE(ran);
+  ASSERT_TRUE(readable(fd, static_cast<int>(kTimeout.count())));
+  loop->runPendingWork();
+  EXPECT_TRUE(ran);
 }
 
 }  // namespace
