@@ -14,6 +14,7 @@
 
 #include "command.h"
 #include "demo_timing.h"
+#include "journal.h"
 #include "kivi/base/error.h"
 #include "kivi/dispatch/worker_pool.h"
 #include "kivi/net/url_session.h"
@@ -28,30 +29,6 @@ namespace {
 
 using Clock = std::chrono::steady_clock;
 using std::chrono::milliseconds;
-
-// Thread-safe, timestamped output.
-class Journal {
- public:
-  explicit Journal(std::ostream& out) : out_(out), start_(Clock::now()) {}
-
-  void line(const std::string& who, const std::string& what) {
-    std::lock_guard lock(mutex_);
-    const double ms = std::chrono::duration<double, std::milli>(Clock::now() - start_).count();
-    char stamp[32];
-    std::snprintf(stamp, sizeof stamp, "%8.2f ms", ms);
-    out_ << "[" << stamp << "] " << std::left << std::setw(13) << who << what << "\n";
-  }
-
-  void heading(const std::string& text) {
-    std::lock_guard lock(mutex_);
-    out_ << "\n== " << text << " ==\n";
-  }
-
- private:
-  std::mutex mutex_;
-  std::ostream& out_;
-  const Clock::time_point start_;
-};
 
 // Counts finished operations; wait() gives up at a deadline.
 class Countdown {

@@ -18,6 +18,7 @@
 #include <thread>
 #include <vector>
 
+#include "journal.h"
 #include "kivi/dispatch/dispatch_queue.h"
 #include "kivi/dispatch/operation.h"
 #include "kivi/dispatch/run_loop.h"
@@ -36,27 +37,17 @@ namespace {
 
 using Clock = std::chrono::steady_clock;
 
-// Timestamped lines from any thread.
+// Journal lines, marked when they come from the main thread.
 class Lines {
  public:
-  explicit Lines(std::ostream& out) : out_(out) {}
+  explicit Lines(std::ostream& out) : journal_(out) {}
   void print(const std::string& who, const std::string& what) {
-    std::lock_guard lock(mutex_);
-    char stamp[32];
-    std::snprintf(stamp, sizeof stamp, "%8.2f ms",
-                  std::chrono::duration<double, std::milli>(Clock::now() - start_).count());
-    out_ << "[" << stamp << "] " << who << (Thread::isMainThread() ? " (main) " : " ") << what
-         << "\n";
+    journal_.line(who + (Thread::isMainThread() ? " (main)" : ""), what);
   }
-  void heading(const std::string& text) {
-    std::lock_guard lock(mutex_);
-    out_ << "\n== " << text << " ==\n";
-  }
+  void heading(const std::string& text) { journal_.heading(text); }
 
  private:
-  std::mutex mutex_;
-  std::ostream& out_;
-  const Clock::time_point start_ = Clock::now();
+  Journal journal_;
 };
 
 Date in(double seconds) { return Date::now().addingTimeInterval(seconds); }
