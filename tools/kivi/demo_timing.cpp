@@ -42,7 +42,7 @@ class Lines {
  public:
   explicit Lines(std::ostream& out) : journal_(out) {}
   void print(const std::string& who, const std::string& what) {
-    journal_.line(who + (Thread::isMainThread() ? " (main)" : ""), what);
+    journal_.line(who + (Thread::isMainThread() ? " (main) " : " "), what);
   }
   void heading(const std::string& text) { journal_.heading(text); }
 

@@ -22,7 +22,7 @@ class Journal {
             .count();
     char stamp[32];
     std::snprintf(stamp, sizeof stamp, "%8.2f ms", ms);
-    out_ << "[" << stamp << "] " << std::left << std::setw(18) << who << what << "\n";
+    out_ << "[" << stamp << "] " << std::left << std::setw(13) << who << what << "\n";
   }
 
   void heading(const std::string& text) {
