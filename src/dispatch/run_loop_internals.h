@@ -26,24 +26,30 @@ struct TimerCore {
   std::vector<std::weak_ptr<RunLoop::Core>> loops;  // guarded by mutex
 };
 
+// The longest wait the library makes: a century stands for "for good"
+// without overflowing the steady clock.
+inline constexpr double kLongestWaitSeconds = 100.0 * 365 * 24 * 3600;
+
+// `seconds` (> 0) as a duration of the steady clock, capped at a century.
+inline DispatchDuration cappedDuration(double seconds) {
+  return std::chrono::duration_cast<DispatchDuration>(
+      std::chrono::duration<double>(std::min(seconds, kLongestWaitSeconds)));
+}
+
 // Seconds from now to `date` as a deadline of the steady clock: NaN and
 // dates long past are now, dates beyond a century are a century away.
 inline DispatchTime deadlineForDate(Date date) {
-  constexpr double kCentury = 100.0 * 365 * 24 * 3600;
   const auto now = DispatchClock::system()->now();
   const double seconds = date.timeIntervalSinceNow();
-  if (!(seconds > 0)) return now;
-  return now + std::chrono::duration_cast<DispatchDuration>(
-                   std::chrono::duration<double>(std::min(seconds, kCentury)));
+  return seconds > 0 ? now + cappedDuration(seconds) : now;
 }
 
 // The platform's smallest timer interval, for intervals at or below zero.
 inline constexpr double kMinimumTimerInterval = 0.0001;
 
 inline double usableTimerInterval(double seconds) {
-  constexpr double kCentury = 100.0 * 365 * 24 * 3600;
   if (!(seconds > 0)) return kMinimumTimerInterval;
-  return std::min(seconds, kCentury);
+  return std::min(seconds, kLongestWaitSeconds);
 }
 
 }  // namespace kivi::detail

@@ -7,6 +7,7 @@
 #include <cmath>
 
 #include "kivi/dispatch/dispatch_clock.h"
+#include "run_loop_internals.h"
 
 namespace kivi {
 
@@ -20,11 +21,7 @@ bool Thread::isMainThread() noexcept {
 void Thread::sleepForTimeInterval(double seconds) {
   if (!(seconds > 0)) return;
   const auto& clock = DispatchClock::system();
-  // A century stands for "for good" without overflowing the clock.
-  constexpr double kLongest = 100.0 * 365 * 24 * 3600;
-  const auto duration = std::chrono::duration_cast<DispatchDuration>(
-      std::chrono::duration<double>(std::min(seconds, kLongest)));
-  clock->sleepUntil(clock->now() + duration);
+  clock->sleepUntil(clock->now() + detail::cappedDuration(seconds));
 }
 
 void Thread::sleepUntilDate(Date date) { sleepForTimeInterval(date.timeIntervalSinceNow()); }

@@ -13,8 +13,7 @@ TimerPtr makeTimer(DispatchTime due, double interval, bool repeats, Timer::Block
   auto core = std::make_shared<detail::TimerCore>();
   core->repeats = repeats;
   core->intervalSeconds = detail::usableTimerInterval(interval);
-  core->interval = std::chrono::duration_cast<DispatchDuration>(
-      std::chrono::duration<double>(core->intervalSeconds));
+  core->interval = detail::cappedDuration(core->intervalSeconds);
   if (core->interval <= DispatchDuration::zero()) core->interval = DispatchDuration(1);
   core->due = due;
   core->block = std::move(block);
@@ -22,9 +21,8 @@ TimerPtr makeTimer(DispatchTime due, double interval, bool repeats, Timer::Block
 }
 
 DispatchTime dueAfter(double interval) {
-  const double seconds = detail::usableTimerInterval(interval);
   return DispatchClock::system()->now() +
-         std::chrono::duration_cast<DispatchDuration>(std::chrono::duration<double>(seconds));
+         detail::cappedDuration(detail::usableTimerInterval(interval));
 }
 
 }  // namespace
