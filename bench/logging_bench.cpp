@@ -110,7 +110,8 @@ void BM_FormatLine_snprintf(benchmark::State& state) {
     benchmark::DoNotOptimize(number);
     char line[256];
     const int n =
-        std::snprintf(line, sizeof line, "%s %d %s", name.asString()->c_str(), number, "done");
+        std::snprintf(line, sizeof line, "%.*s %d %s", static_cast<int>(name.asString()->size()),
+                      name.asString()->data(), number, "done");
     delegate->logInfoWithModule(kModule, __FILE__, __func__, 42,
                                 std::string_view(line, static_cast<std::size_t>(n)));
   }

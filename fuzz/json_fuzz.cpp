@@ -10,12 +10,17 @@
 //     64 bits sends it to the careful one; the value read must be the same,
 //     number flavours and the sign of zero included;
 //   - every value read writes back (compact, pretty, unescaped slashes) and
-//     reads again to an equal value.
+//     reads again to an equal value;
+//   - the tree keeps its shape invariants: every dictionary's keys strictly
+//     ascending, and a copy taken out of the document (its own storage, not
+//     the document's arena) equal to it and still readable once the document
+//     is gone.
 #include <cmath>
 #include <cstddef>
 #include <cstdint>
 #include <string>
 #include <string_view>
+#include <vector>
 
 #include "fuzz_check.h"
 #include "kivi/text/json_serialization.h"
@@ -56,6 +61,41 @@ bool identical(const kivi::Value& a, const kivi::Value& b) {
   return a == b;
 }
 
+// Every dictionary in the tree has strictly ascending keys; walks with a
+// stack so that deep documents do not recurse.
+bool keysAscend(const kivi::Value& root) {
+  std::vector<const kivi::Value*> pending{&root};
+  while (!pending.empty()) {
+    const kivi::Value* v = pending.back();
+    pending.pop_back();
+    if (const kivi::Array* a = v->asArray()) {
+      for (const kivi::Value& e : *a) pending.push_back(&e);
+    } else if (const kivi::Dictionary* d = v->asDictionary()) {
+      for (auto i = d->begin(); i != d->end(); ++i) {
+        if (i != d->begin() && !(i[-1].first.view() < i->first.view())) return false;
+        pending.push_back(&i->second);
+      }
+    }
+  }
+  return true;
+}
+
+// A deep copy made of the library's own containers, never of the arena.
+kivi::Value ownCopy(const kivi::Value& v) {
+  if (const kivi::Array* a = v.asArray()) {
+    kivi::Array copy;
+    for (const kivi::Value& e : *a) copy.push_back(ownCopy(e));
+    return kivi::Value(std::move(copy));
+  }
+  if (const kivi::Dictionary* d = v.asDictionary()) {
+    kivi::Dictionary copy;
+    for (const auto& [key, member] : *d) copy.emplace(kivi::String(key.view()), ownCopy(member));
+    return kivi::Value(std::move(copy));
+  }
+  if (const kivi::String* s = v.asString()) return kivi::Value(std::string(s->view()));
+  return v;
+}
+
 }  // namespace
 
 extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size) {
@@ -82,6 +122,20 @@ extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size
   check(strict.has_value() == container, "fragments option decides only the top level", text);
   check(!strict || *strict == *value, "same value with and without the fragments option", text);
   check(JSONSerialization::isValidJSONObject(*value) == container, "isValidJSONObject", text);
+
+  check(keysAscend(*value), "dictionary keys strictly ascending", text);
+  if (value->kind() != kivi::Value::Kind::Array || value->asArray()->size() < 10000) {
+    kivi::Value own = ownCopy(*value);
+    kivi::Value part = value->at(0) ? *value->at(0) : *value;
+    {
+      auto reread =
+          JSONSerialization::JSONObjectWithData(text, kivi::JSONReadingFragmentsAllowed, nullptr);
+      check(reread && identical(*reread, own), "a copy made of own containers is equal", text);
+      part = reread->at(0) ? *reread->at(0) : *reread;  // outlives its document
+    }
+    check(identical(part, value->at(0) ? *value->at(0) : *value), "a part outlives its document",
+          text);
+  }
 
   const std::string careful = "[" + std::string(text) + ",18446744073709551616]";
   const auto carefulValue = JSONSerialization::JSONObjectWithData(careful, 0, &error);

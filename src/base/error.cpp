@@ -12,7 +12,7 @@ ErrorPtr Error::create(std::string domain, std::int64_t code, Dictionary userInf
 std::string Error::localizedDescription() const {
   auto it = userInfo_.find(LocalizedDescriptionKey);
   if (it != userInfo_.end()) {
-    if (const std::string* text = it->second.asString()) return *text;
+    if (const String* text = it->second.asString()) return *text;
   }
   return "The operation couldn\u2019t be completed. (" + domain_ + " error " +
          std::to_string(code_) + ".)";

@@ -98,22 +98,6 @@ bool operator==(const Number& a, const Number& b) noexcept {
          static_cast<std::int64_t>(d.d_) == i.i_;
 }
 
-Value::Value(Array a) : v_(std::make_shared<const Array>(std::move(a))) {}
-Value::Value(Dictionary d) : v_(std::make_shared<const Dictionary>(std::move(d))) {}
-Value::Value(std::shared_ptr<Object> o) noexcept {
-  if (o) v_ = std::move(o);
-}
-
-const Array* Value::asArray() const noexcept {
-  auto* p = std::get_if<std::shared_ptr<const Array>>(&v_);
-  return p ? p->get() : nullptr;
-}
-
-const Dictionary* Value::asDictionary() const noexcept {
-  auto* p = std::get_if<std::shared_ptr<const Dictionary>>(&v_);
-  return p ? p->get() : nullptr;
-}
-
 const Value* Value::find(std::string_view key) const noexcept {
   const Dictionary* d = asDictionary();
   if (!d) return nullptr;
@@ -124,35 +108,6 @@ const Value* Value::find(std::string_view key) const noexcept {
 const Value* Value::at(std::size_t index) const noexcept {
   const Array* a = asArray();
   return a && index < a->size() ? &(*a)[index] : nullptr;
-}
-
-void Value::releaseCollection() noexcept {
-  // Collections released while another one is (by the destruction of its
-  // elements) wait in `pending` for the loop below, so that nesting never
-  // deepens the stack.
-  thread_local std::vector<std::shared_ptr<const void>>* pending = nullptr;
-  std::shared_ptr<const void> collection;
-  if (auto* array = std::get_if<std::shared_ptr<const Array>>(&v_)) {
-    collection = std::move(*array);
-  } else {
-    collection = std::move(*std::get_if<std::shared_ptr<const Dictionary>>(&v_));
-  }
-  if (pending != nullptr) {
-    try {
-      pending->push_back(std::move(collection));
-    } catch (...) {  // out of memory: released here instead, recursively
-    }
-    return;
-  }
-  std::vector<std::shared_ptr<const void>> waiting;
-  pending = &waiting;
-  collection.reset();
-  while (!waiting.empty()) {
-    std::shared_ptr<const void> next = std::move(waiting.back());
-    waiting.pop_back();
-    next.reset();
-  }
-  pending = nullptr;
 }
 
 bool operator==(const Value& a, const Value& b) noexcept {
@@ -185,7 +140,7 @@ bool operator==(const Value& a, const Value& b) noexcept {
         const Array* p = x->asArray();
         const Array* q = y->asArray();
         if (p == q) break;
-        if (!p || !q || p->size() != q->size()) return false;  // (null: moved from)
+        if (p->size() != q->size()) return false;
         for (std::size_t i = p->size(); i-- > 0;) pending.emplace_back(&(*p)[i], &(*q)[i]);
         break;
       }
@@ -193,7 +148,7 @@ bool operator==(const Value& a, const Value& b) noexcept {
         const Dictionary* p = x->asDictionary();
         const Dictionary* q = y->asDictionary();
         if (p == q) break;
-        if (!p || !q || p->size() != q->size()) return false;  // (null: moved from)
+        if (p->size() != q->size()) return false;
         for (auto i = p->begin(), j = q->begin(); i != p->end(); ++i, ++j) {
           if (i->first != j->first) return false;
           pending.emplace_back(&i->second, &j->second);
@@ -213,7 +168,7 @@ bool operator==(const Value& a, const Value& b) noexcept {
 
 namespace {
 
-void appendQuoted(std::string& out, const std::string& s) {
+void appendQuoted(std::string& out, std::string_view s) {
   out += '"';
   for (char c : s) {
     if (c == '"' || c == '\\') out += '\\';

@@ -1,6 +1,8 @@
 #include "kivi/logging/log_redaction.h"
 
 #include <algorithm>
+#include <optional>
+#include <string>
 
 #include "kivi/net/http_cookie.h"
 #include "kivi/net/url_components.h"
@@ -14,12 +16,15 @@ constexpr const char* kMask = "***";
 
 std::string masked(const std::string& value) { return value.empty() ? "" : kMask; }
 Value masked(const Value& value) {
-  const std::string* text = value.asString();
-  return Value(text ? masked(*text) : kMask);
+  const String* text = value.asString();
+  return Value(text && text->empty() ? "" : kMask);
 }
 
-const std::string* text(const std::string& value) { return &value; }
-const std::string* text(const Value& value) { return value.asString(); }
+std::optional<std::string> text(const std::string& value) { return value; }
+std::optional<std::string> text(const Value& value) {
+  const String* s = value.asString();
+  return s ? std::optional<std::string>(s->str()) : std::nullopt;
+}
 
 // Masks "Authorization" and rewrites "Set-Cookie" in place; works on both
 // header dictionary forms. Names are matched exactly: the cookies come from
@@ -31,7 +36,8 @@ void redact(Headers& headers, const URLPtr& url) {
   }
   if (!url) return;
   const auto field = headers.find("Set-Cookie");
-  const std::string* value = field == headers.end() ? nullptr : text(field->second);
+  const std::optional<std::string> value =
+      field == headers.end() ? std::nullopt : text(field->second);
   if (!value) return;
   const auto cookies = HTTPCookie::cookiesWithResponseHeaderFields({{"Set-Cookie", *value}}, *url);
   if (cookies.empty()) return;

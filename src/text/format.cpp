@@ -165,7 +165,7 @@ std::string_view describe(const FormatArg& arg, int precision, std::string& stor
       return arg.stringValue();
     case Kind::Value: {
       const Value& value = arg.valueValue();
-      if (const std::string* s = value.asString()) return *s;
+      if (const String* s = value.asString()) return *s;
       if (const Number* n = value.asNumber()) {
         switch (n->type()) {
           case Number::Type::Bool:

@@ -76,7 +76,7 @@ std::optional<Value> valueForCaseInsensitiveKey(const Dictionary& dictionary, st
                                                 std::optional<Value> defaultValue) {
   const Value* value = findCaseInsensitive(dictionary, unicode::trimView(key));
   if (!value) return defaultValue;
-  if (const std::string* string = value->asString(); string && string->empty()) {
+  if (const String* string = value->asString(); string && string->empty()) {
     return defaultValue ? std::move(defaultValue) : std::optional<Value>(Value(""));
   }
   return *value;
@@ -87,7 +87,7 @@ bool boolForCaseInsensitiveKey(const Dictionary& dictionary, std::string_view ke
   const Value* value = findCaseInsensitive(dictionary, key);
   if (!value) return defaultValue;
   if (const Number* number = value->asNumber()) return number->boolValue();
-  if (const std::string* string = value->asString()) return boolFromString(*string);
+  if (const String* string = value->asString()) return boolFromString(*string);
   return defaultValue;
 }
 
@@ -103,7 +103,7 @@ Dictionary dictionaryWithLowercaseKeys(const Dictionary& dictionary) {
 
 namespace JSONSupport {
 
-const std::string* jsonStringForKey(const Dictionary& dictionary, OptionalKey key) {
+const String* jsonStringForKey(const Dictionary& dictionary, OptionalKey key) {
   const Value* value = find(dictionary, key);
   return value ? value->asString() : nullptr;
 }
@@ -130,7 +130,7 @@ const Dictionary* jsonDictionaryForKey(const Dictionary& dictionary, OptionalKey
 }
 
 std::optional<Date> jsonDateFromUTCStringForKey(const Dictionary& dictionary, OptionalKey key) {
-  const std::string* text = jsonStringForKey(dictionary, key);
+  const String* text = jsonStringForKey(dictionary, key);
   if (!text) return std::nullopt;
   return KivUtils::utcDateFormatter()->dateFromString(*text);
 }
@@ -145,7 +145,7 @@ std::optional<Date> jsonDateFromEpochMillisecondsValueForKey(const Dictionary& d
 }
 
 URLPtr jsonUrlForKey(const Dictionary& dictionary, OptionalKey key) {
-  const std::string* text = jsonStringForKey(dictionary, key);
+  const String* text = jsonStringForKey(dictionary, key);
   if (!text) return nullptr;
   const std::string_view trimmed = unicode::trimView(*text);
   if (trimmed.empty()) return nullptr;

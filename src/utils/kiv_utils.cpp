@@ -111,7 +111,7 @@ std::string sha256AsString(const Data& data) { return sha256Hex(data); }
 bool trimmedCaseInsensitiveContains(const Array& array, std::string_view needle) {
   const std::string_view trimmedNeedle = unicode::trimView(needle);
   return std::any_of(array.begin(), array.end(), [&](const Value& element) {
-    const std::string* text = element.asString();
+    const String* text = element.asString();
     return text && caseInsensitiveEquals(unicode::trimView(*text), trimmedNeedle);
   });
 }

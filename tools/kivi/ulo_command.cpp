@@ -63,7 +63,7 @@ int runUlo(const std::vector<std::string>& args, std::ostream& out, std::ostream
   const auto noAnswer = [&] {
     err << "kivi ulo " << args[0] << ": the search for '" << args[2]
         << "' stopped before it could decide ("
-        << undecided->userInfo().at(DebugDescriptionErrorKey).description() << ")\n";
+        << undecided->userInfo().find(DebugDescriptionErrorKey)->second.description() << ")\n";
     return 3;
   };
   if (get) {

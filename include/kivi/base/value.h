@@ -6,7 +6,7 @@
 //   null marker   Value() / Value(nullptr)          (the platform's NSNull)
 //   number        Value(42), Value(3.5), Value(true) (a Number; booleans are
 //                                                     numbers of bool flavour)
-//   string        Value("text")                     (UTF-8)
+//   string        Value("text")                     (UTF-8, a String)
 //   data          Value(Data{...})                  (raw bytes)
 //   date          Value(Date{seconds})              (seconds since 1970, UTC)
 //   URL           Value(URLPtr)                     (a null pointer gives the
@@ -23,22 +23,39 @@
 //   d["name"] = kivi::Value("new");
 //   value = kivi::Value(std::move(d));
 //
+//   if (const kivi::String* name = value.find("name")->asString())
+//     std::cout << *name;  // a String reads as a std::string_view
+//
 // "Absent" is not a Value: functions that may find nothing return
 // std::optional<Value> or a null pointer from the as…() accessors.
 //
+// Representation (what it costs): a Value is 24 bytes. Numbers, dates and
+// strings of up to 22 bytes live inside it; longer strings, data, arrays and
+// dictionaries are shared, reference-counted blocks. A Dictionary is a flat
+// array sorted by key: lookups are binary searches and iterating walks memory
+// in order, while inserting one key shifts the keys after it, so build a large
+// dictionary from a vector of entries (the range constructor sorts once). A
+// document read by JSONSerialization lives in one arena that is freed at once
+// when its last Value goes away.
+//
 // Thread contract: a Value is a value type. Distinct Values may be used from
 // different threads freely; one Value may be read from many threads at once
-// and needs outside synchronisation only if it is also assigned to.
+// and needs outside synchronisation only if it is also assigned to. The same
+// holds for String, Array and Dictionary.
 #pragma once
 
 #include <compare>
+#include <cstddef>
 #include <cstdint>
-#include <map>
+#include <cstring>
+#include <initializer_list>
+#include <iosfwd>
+#include <iterator>
 #include <memory>
 #include <string>
 #include <string_view>
 #include <type_traits>
-#include <variant>
+#include <utility>
 #include <vector>
 
 namespace kivi {
@@ -46,6 +63,13 @@ namespace kivi {
 class Object;
 class URL;
 class Value;
+class Array;
+class Dictionary;
+
+namespace detail {
+struct ValueNode;
+class DocumentBuilder;
+}  // namespace detail
 
 using URLPtr = std::shared_ptr<const URL>;
 
@@ -55,8 +79,6 @@ struct Null {
 };
 
 using Data = std::vector<std::uint8_t>;
-using Array = std::vector<Value>;
-using Dictionary = std::map<std::string, Value, std::less<>>;
 
 // A point in time: seconds since 1970-01-01T00:00:00Z.
 struct Date {
@@ -115,6 +137,123 @@ class Number {
   };
 };
 
+// An immutable UTF-8 string: the text of a string Value and the key of a
+// Dictionary. Up to 22 bytes are kept inline; longer text is shared between
+// copies. It reads as a std::string_view; str() copies it out.
+//
+//   kivi::String key = "name";
+//   std::string_view view = key;
+//   if (key == "name") ...
+class String {
+ public:
+  static constexpr std::size_t kInlineCapacity = 22;
+
+  String() noexcept { bytes_[kTagByte] = 0; }
+  String(std::string_view text);
+  String(const char* text) : String(std::string_view(text ? text : "")) {}
+  String(const std::string& text) : String(std::string_view(text)) {}
+  String(const String& other) {
+    if (other.isInline()) {
+      std::memcpy(bytes_, other.bytes_, sizeof bytes_);
+    } else {
+      copySlow(other);
+    }
+  }
+  String(String&& other) noexcept {
+    std::memcpy(bytes_, other.bytes_, sizeof bytes_);
+    other.bytes_[kTagByte] = 0;
+  }
+  String& operator=(const String& other) {
+    if (this != &other) {
+      String copy(other);
+      swap(copy);
+    }
+    return *this;
+  }
+  String& operator=(String&& other) noexcept {
+    if (this != &other) {
+      String moved(std::move(other));
+      swap(moved);
+    }
+    return *this;
+  }
+  ~String() {
+    if (!isInline()) releaseSlow();
+  }
+
+  const char* data() const noexcept {
+    return isInline() ? bytes_ : static_cast<const char*>(pointer());
+  }
+  std::size_t size() const noexcept { return isInline() ? tag() : outOfLineSize(); }
+  std::size_t length() const noexcept { return size(); }
+  bool empty() const noexcept { return size() == 0; }
+  const char* begin() const noexcept { return data(); }
+  const char* end() const noexcept { return data() + size(); }
+  char operator[](std::size_t i) const noexcept { return data()[i]; }
+
+  std::string_view view() const noexcept { return {data(), size()}; }
+  operator std::string_view() const noexcept { return view(); }
+  std::string str() const { return std::string(view()); }
+  // Implicit, as a std::string argument is the common case; it copies.
+  operator std::string() const { return str(); }
+
+  void swap(String& other) noexcept {
+    unsigned char t[sizeof bytes_];
+    std::memcpy(t, bytes_, sizeof t);
+    std::memcpy(bytes_, other.bytes_, sizeof t);
+    std::memcpy(other.bytes_, t, sizeof t);
+  }
+
+  friend bool operator==(const String& a, std::string_view b) noexcept { return a.view() == b; }
+  friend std::strong_ordering operator<=>(const String& a, std::string_view b) noexcept {
+    return a.view().compare(b) <=> 0;
+  }
+  friend std::string operator+(const String& a, std::string_view b) {
+    std::string s(a.view());
+    s += b;
+    return s;
+  }
+  friend std::string operator+(std::string_view a, const String& b) {
+    std::string s(a);
+    s += b.view();
+    return s;
+  }
+  friend std::ostream& operator<<(std::ostream& out, const String& s);
+
+ private:
+  friend class detail::DocumentBuilder;
+  friend class Value;
+  // bytes_[22] holds the inline length (0…22) or one of these marks; an
+  // out-of-line string keeps its pointer in bytes 0–7 and its length in 8–15.
+  static constexpr std::size_t kTagByte = 22;
+  static constexpr unsigned char kShared = 0x80;    // a reference-counted block
+  static constexpr unsigned char kBorrowed = 0x81;  // text in a document's arena
+
+  bool isInline() const noexcept { return tag() <= kInlineCapacity; }
+  const void* pointer() const noexcept {
+    const void* p;
+    std::memcpy(&p, bytes_, sizeof p);
+    return p;
+  }
+  std::size_t outOfLineSize() const noexcept {
+    std::size_t n;
+    std::memcpy(&n, bytes_ + 8, sizeof n);
+    return n;
+  }
+  void setOutOfLine(const void* p, std::size_t n, unsigned char mark) noexcept {
+    std::memcpy(bytes_, &p, sizeof p);
+    std::memcpy(bytes_ + 8, &n, sizeof n);
+    bytes_[kTagByte] = static_cast<char>(mark);
+  }
+  void copySlow(const String& other);
+  void releaseSlow() noexcept;
+
+  unsigned char tag() const noexcept { return static_cast<unsigned char>(bytes_[kTagByte]); }
+
+  char bytes_[23];
+};
+static_assert(sizeof(String) == 23);
+
 class Value {
  public:
   enum class Kind : std::uint8_t {
@@ -129,68 +268,100 @@ class Value {
     Object
   };
 
-  Value() noexcept = default;
-  Value(const Value&) = default;
-  Value(Value&&) noexcept = default;
-  Value& operator=(const Value&) = default;
-  Value& operator=(Value&&) noexcept = default;
+  Value() noexcept { kind_ = Kind::Null; }
+  Value(const Value& other) {
+    if (other.isPlain()) {
+      std::memcpy(static_cast<void*>(this), &other, sizeof(Value));
+    } else {
+      copySlow(other);
+    }
+  }
+  Value(Value&& other) noexcept {
+    std::memcpy(static_cast<void*>(this), &other, sizeof(Value));
+    other.kind_ = Kind::Null;
+  }
+  Value& operator=(const Value& other) {
+    if (this != &other) {
+      Value copy(other);
+      swap(copy);
+    }
+    return *this;
+  }
+  Value& operator=(Value&& other) noexcept {
+    if (this != &other) {
+      Value moved(std::move(other));
+      swap(moved);
+    }
+    return *this;
+  }
   // Releases nested collections one after another, never recursively: a
   // Value nested a million levels deep is dropped like a flat one.
   ~Value() {
-    if (holdsCollection()) releaseCollection();
+    if (!isPlain()) releaseSlow();
   }
 
-  Value(std::nullptr_t) noexcept {}
-  Value(Null) noexcept {}
-  Value(Number n) noexcept : v_(n) {}
-  Value(bool b) noexcept : v_(Number(b)) {}
-  Value(int i) noexcept : v_(Number(static_cast<std::int64_t>(i))) {}
-  Value(long i) noexcept : v_(Number(static_cast<std::int64_t>(i))) {}
-  Value(long long i) noexcept : v_(Number(static_cast<std::int64_t>(i))) {}
-  Value(unsigned i) noexcept : v_(Number(static_cast<std::uint64_t>(i))) {}
-  Value(unsigned long i) noexcept : v_(Number(static_cast<std::uint64_t>(i))) {}
-  Value(unsigned long long i) noexcept : v_(Number(static_cast<std::uint64_t>(i))) {}
-  Value(double d) noexcept : v_(Number(d)) {}
-  Value(const char* s) : v_(std::string(s ? s : "")) {}
-  Value(std::string s) noexcept : v_(std::move(s)) {}
-  Value(std::string_view s) : v_(std::string(s)) {}
-  Value(Data d) noexcept : v_(std::move(d)) {}
-  Value(Date d) noexcept : v_(d) {}
+  Value(std::nullptr_t) noexcept : Value() {}
+  Value(Null) noexcept : Value() {}
+  Value(Number n) noexcept { setNumber(n); }
+  Value(bool b) noexcept { setNumber(Number(b)); }
+  Value(int i) noexcept { setNumber(Number(static_cast<std::int64_t>(i))); }
+  Value(long i) noexcept { setNumber(Number(static_cast<std::int64_t>(i))); }
+  Value(long long i) noexcept { setNumber(Number(static_cast<std::int64_t>(i))); }
+  Value(unsigned i) noexcept { setNumber(Number(static_cast<std::uint64_t>(i))); }
+  Value(unsigned long i) noexcept { setNumber(Number(static_cast<std::uint64_t>(i))); }
+  Value(unsigned long long i) noexcept { setNumber(Number(static_cast<std::uint64_t>(i))); }
+  Value(double d) noexcept { setNumber(Number(d)); }
+  Value(String s) noexcept {
+    new (raw_) String(std::move(s));
+    kind_ = Kind::String;
+  }
+  Value(const char* s) : Value(String(s)) {}
+  Value(const std::string& s) : Value(String(s)) {}
+  Value(std::string_view s) : Value(String(s)) {}
+  Value(Data d);
+  Value(Date d) noexcept {
+    new (raw_) Date(d);
+    kind_ = Kind::Date;
+  }
   // A URL is kept as the object it is; the URL type itself belongs to the
   // network layer, so these two are templates that take shape where it is
   // known.
   template <class T>
   requires(std::is_convertible_v<std::shared_ptr<T>, URLPtr>) Value(std::shared_ptr<T> url)
-  noexcept {
-    if (url) v_ = URLHandle{std::shared_ptr<const Object>(URLPtr(std::move(url)))};
+      : Value() {
+    if (url) setURL(std::shared_ptr<const Object>(URLPtr(std::move(url))));
   }
   Value(Array a);
   Value(Dictionary d);
-  Value(std::shared_ptr<Object> o) noexcept;
+  Value(std::shared_ptr<Object> o);
   template <class T>
   requires(!std::is_same_v<T, Object> &&
            std::is_convertible_v<std::shared_ptr<T>, std::shared_ptr<Object>> &&
            !std::is_convertible_v<std::shared_ptr<T>, URLPtr>) Value(std::shared_ptr<T> o)
-  noexcept : Value(std::shared_ptr<Object>(std::move(o))) {}
+      : Value(std::shared_ptr<Object>(std::move(o))) {}
 
-  Kind kind() const noexcept { return static_cast<Kind>(v_.index()); }
-  bool isNull() const noexcept { return kind() == Kind::Null; }
+  Kind kind() const noexcept { return kind_; }
+  bool isNull() const noexcept { return kind_ == Kind::Null; }
 
   // Typed views; null when the value is of another kind.
-  const Number* asNumber() const noexcept { return std::get_if<Number>(&v_); }
-  const std::string* asString() const noexcept { return std::get_if<std::string>(&v_); }
-  const Data* asData() const noexcept { return std::get_if<Data>(&v_); }
-  const Date* asDate() const noexcept { return std::get_if<Date>(&v_); }
+  const Number* asNumber() const noexcept {
+    return kind_ == Kind::Number ? std::launder(reinterpret_cast<const Number*>(raw_)) : nullptr;
+  }
+  const String* asString() const noexcept {
+    return kind_ == Kind::String ? std::launder(reinterpret_cast<const String*>(raw_)) : nullptr;
+  }
+  const Data* asData() const noexcept;
+  const Date* asDate() const noexcept {
+    return kind_ == Kind::Date ? std::launder(reinterpret_cast<const Date*>(raw_)) : nullptr;
+  }
   template <class U = URL>
   std::shared_ptr<const U> asURL() const noexcept {
-    auto* p = std::get_if<URLHandle>(&v_);
-    return p ? std::static_pointer_cast<const U>(p->object) : nullptr;
+    const std::shared_ptr<const Object>* url = urlObject();
+    return url ? std::static_pointer_cast<const U>(*url) : nullptr;
   }
   const Array* asArray() const noexcept;
   const Dictionary* asDictionary() const noexcept;
-  const std::shared_ptr<Object>* asObject() const noexcept {
-    return std::get_if<std::shared_ptr<Object>>(&v_);
-  }
+  const std::shared_ptr<Object>* asObject() const noexcept;
   // The object, if it is one of type T.
   template <class T>
   std::shared_ptr<T> asObjectOf() const {
@@ -210,21 +381,290 @@ class Value {
   // A readable rendering for logs and diagnostics (not JSON).
   std::string description() const;
 
- private:
-  // An array or dictionary, not just the moved-from husk of one.
-  bool holdsCollection() const noexcept {
-    if (auto* array = std::get_if<std::shared_ptr<const Array>>(&v_)) return *array != nullptr;
-    auto* dictionary = std::get_if<std::shared_ptr<const Dictionary>>(&v_);
-    return dictionary != nullptr && *dictionary != nullptr;
+  void swap(Value& other) noexcept {
+    alignas(8) unsigned char t[sizeof(Value)];
+    std::memcpy(t, static_cast<void*>(this), sizeof t);
+    std::memcpy(static_cast<void*>(this), &other, sizeof t);
+    std::memcpy(static_cast<void*>(&other), t, sizeof t);
   }
-  void releaseCollection() noexcept;
 
-  struct URLHandle {
-    std::shared_ptr<const Object> object;  // a URL
-  };
-  std::variant<Null, Number, std::string, Data, Date, URLHandle, std::shared_ptr<const Array>,
-               std::shared_ptr<const Dictionary>, std::shared_ptr<Object>>
-      v_;
+ private:
+  friend class detail::DocumentBuilder;
+  friend class Array;
+
+  // Null, a number, a date or an inline string: copied as bytes, nothing to
+  // release.
+  bool isPlain() const noexcept {
+    return kind_ == Kind::Null || kind_ == Kind::Number || kind_ == Kind::Date ||
+           (kind_ == Kind::String &&
+            static_cast<unsigned char>(raw_[String::kTagByte]) <= String::kInlineCapacity);
+  }
+  void setNumber(Number n) noexcept {
+    new (raw_) Number(n);
+    kind_ = Kind::Number;
+  }
+  detail::ValueNode* node() const noexcept {
+    detail::ValueNode* p;
+    std::memcpy(&p, raw_, sizeof p);
+    return p;
+  }
+  void setNode(Kind kind, detail::ValueNode* p) noexcept {
+    std::memcpy(raw_, &p, sizeof p);
+    kind_ = kind;
+  }
+  void setURL(std::shared_ptr<const Object> url);
+  const std::shared_ptr<const Object>* urlObject() const noexcept;
+  void copySlow(const Value& other);
+  void releaseSlow() noexcept;
+
+  alignas(8) unsigned char raw_[23];
+  Kind kind_;
 };
+static_assert(sizeof(Value) == 24);
+
+// An array of Values with the interface of a std::vector. An Array read from
+// a JSON document shares the document's storage and is read-only (reach it
+// through a const pointer); copying it gives an Array of its own.
+class Array {
+ public:
+  using value_type = Value;
+  using size_type = std::size_t;
+  using difference_type = std::ptrdiff_t;
+  using reference = Value&;
+  using const_reference = const Value&;
+  using pointer = Value*;
+  using const_pointer = const Value*;
+  using iterator = Value*;
+  using const_iterator = const Value*;
+  using reverse_iterator = std::reverse_iterator<iterator>;
+  using const_reverse_iterator = std::reverse_iterator<const_iterator>;
+
+  Array() noexcept = default;
+  Array(std::initializer_list<Value> values);
+  explicit Array(size_type count);
+  Array(size_type count, const Value& value);
+  template <class InputIt>
+  requires(!std::is_integral_v<InputIt>) Array(InputIt first, InputIt last) {
+    for (; first != last; ++first) emplace_back(*first);
+  }
+  Array(const Array& other);
+  Array(Array&& other) noexcept
+      : data_(other.data_),
+        size_(other.size_),
+        capacity_(other.capacity_),
+        borrowed_(other.borrowed_) {
+    other.data_ = nullptr;
+    other.size_ = other.capacity_ = 0;
+    other.borrowed_ = false;
+  }
+  Array& operator=(const Array& other);
+  Array& operator=(Array&& other) noexcept;
+  ~Array();
+
+  size_type size() const noexcept { return size_; }
+  bool empty() const noexcept { return size_ == 0; }
+  size_type capacity() const noexcept { return capacity_; }
+  void reserve(size_type n);
+  void clear() noexcept;
+  void resize(size_type n);
+
+  Value* data() noexcept { return data_; }
+  const Value* data() const noexcept { return data_; }
+  iterator begin() noexcept { return data_; }
+  iterator end() noexcept { return data_ + size_; }
+  const_iterator begin() const noexcept { return data_; }
+  const_iterator end() const noexcept { return data_ + size_; }
+  const_iterator cbegin() const noexcept { return begin(); }
+  const_iterator cend() const noexcept { return end(); }
+  reverse_iterator rbegin() noexcept { return reverse_iterator(end()); }
+  reverse_iterator rend() noexcept { return reverse_iterator(begin()); }
+  const_reverse_iterator rbegin() const noexcept { return const_reverse_iterator(end()); }
+  const_reverse_iterator rend() const noexcept { return const_reverse_iterator(begin()); }
+
+  Value& operator[](size_type i) noexcept { return data_[i]; }
+  const Value& operator[](size_type i) const noexcept { return data_[i]; }
+  Value& front() noexcept { return data_[0]; }
+  const Value& front() const noexcept { return data_[0]; }
+  Value& back() noexcept { return data_[size_ - 1]; }
+  const Value& back() const noexcept { return data_[size_ - 1]; }
+
+  void push_back(const Value& value);
+  void push_back(Value&& value);
+  template <class... Args>
+  Value& emplace_back(Args&&... args);
+  void pop_back() noexcept;
+  iterator insert(const_iterator position, Value value);
+  template <class InputIt>
+  iterator insert(const_iterator position, InputIt first, InputIt last) {
+    const difference_type at = position - begin();
+    for (difference_type i = at; first != last; ++first, ++i) insert(begin() + i, Value(*first));
+    return begin() + at;
+  }
+  iterator erase(const_iterator position);
+  iterator erase(const_iterator first, const_iterator last);
+
+  friend bool operator==(const Array& a, const Array& b) noexcept;
+
+ private:
+  friend class detail::DocumentBuilder;
+  void grow(size_type atLeast);
+  void makeOwn();
+
+  Value* data_ = nullptr;
+  std::uint32_t size_ = 0;
+  std::uint32_t capacity_ = 0;
+  bool borrowed_ = false;  // the elements belong to a document's arena
+};
+
+// One member of a Dictionary: `first` is the key, `second` the value, as in a
+// std::map, so `for (const auto& [key, value] : dictionary)` reads the same.
+struct DictionaryEntry {
+  String first;
+  Value second;
+};
+
+// A dictionary with string keys and the interface of a std::map, kept as an
+// array sorted by key (byte order). Iterators and element pointers stay valid
+// until the dictionary is next changed.
+class Dictionary {
+ public:
+  using key_type = String;
+  using mapped_type = Value;
+  using value_type = DictionaryEntry;
+  using size_type = std::size_t;
+  using difference_type = std::ptrdiff_t;
+  using reference = DictionaryEntry&;
+  using const_reference = const DictionaryEntry&;
+  using iterator = DictionaryEntry*;
+  using const_iterator = const DictionaryEntry*;
+  using reverse_iterator = std::reverse_iterator<iterator>;
+  using const_reverse_iterator = std::reverse_iterator<const_iterator>;
+
+  Dictionary() noexcept = default;
+  // Of duplicate keys the first is kept, as std::map does.
+  Dictionary(std::initializer_list<DictionaryEntry> entries);
+  template <class InputIt>
+  Dictionary(InputIt first, InputIt last) {
+    std::vector<DictionaryEntry> entries;
+    for (; first != last; ++first) entries.push_back(DictionaryEntry{first->first, first->second});
+    adopt(std::move(entries), /*lastWins=*/false);
+  }
+  // Sorts once; of duplicate keys the first or, with lastWins, the last is
+  // kept. The way to build a large dictionary.
+  explicit Dictionary(std::vector<DictionaryEntry> entries, bool lastWins = false) {
+    adopt(std::move(entries), lastWins);
+  }
+  Dictionary(const Dictionary& other);
+  Dictionary(Dictionary&& other) noexcept
+      : data_(other.data_),
+        size_(other.size_),
+        capacity_(other.capacity_),
+        borrowed_(other.borrowed_) {
+    other.data_ = nullptr;
+    other.size_ = other.capacity_ = 0;
+    other.borrowed_ = false;
+  }
+  Dictionary& operator=(const Dictionary& other);
+  Dictionary& operator=(Dictionary&& other) noexcept;
+  ~Dictionary();
+
+  size_type size() const noexcept { return size_; }
+  bool empty() const noexcept { return size_ == 0; }
+  void clear() noexcept;
+  void reserve(size_type n);
+
+  iterator begin() noexcept { return data_; }
+  iterator end() noexcept { return data_ + size_; }
+  const_iterator begin() const noexcept { return data_; }
+  const_iterator end() const noexcept { return data_ + size_; }
+  const_iterator cbegin() const noexcept { return begin(); }
+  const_iterator cend() const noexcept { return end(); }
+  reverse_iterator rbegin() noexcept { return reverse_iterator(end()); }
+  reverse_iterator rend() noexcept { return reverse_iterator(begin()); }
+  const_reverse_iterator rbegin() const noexcept { return const_reverse_iterator(end()); }
+  const_reverse_iterator rend() const noexcept { return const_reverse_iterator(begin()); }
+
+  // The first entry whose key is not less than `key`.
+  const_iterator lower_bound(std::string_view key) const noexcept;
+  iterator lower_bound(std::string_view key) noexcept {
+    return data_ + (std::as_const(*this).lower_bound(key) - data_);
+  }
+  const_iterator find(std::string_view key) const noexcept {
+    const_iterator it = lower_bound(key);
+    return it != end() && it->first == key ? it : end();
+  }
+  iterator find(std::string_view key) noexcept {
+    return data_ + (std::as_const(*this).find(key) - data_);
+  }
+  size_type count(std::string_view key) const noexcept { return find(key) != end() ? 1 : 0; }
+  bool contains(std::string_view key) const noexcept { return find(key) != end(); }
+
+  // The value under `key`, inserted as null when absent.
+  Value& operator[](std::string_view key) { return try_emplace(key).first->second; }
+  // The value under `key`; unlike std::map::at it never throws: an absent
+  // key reads as a null Value.
+  const Value& at(std::string_view key) const noexcept;
+
+  template <class... Args>
+  std::pair<iterator, bool> try_emplace(std::string_view key, Args&&... args) {
+    iterator it = lower_bound(key);
+    if (it != end() && it->first == key) return {it, false};
+    return {insertAt(it - data_, String(key), Value(std::forward<Args>(args)...)), true};
+  }
+  template <class K, class V>
+  std::pair<iterator, bool> emplace(K&& key, V&& value) {
+    return try_emplace(std::string_view(keyView(key)), std::forward<V>(value));
+  }
+  template <class K, class V>
+  iterator emplace_hint(const_iterator, K&& key, V&& value) {
+    return emplace(std::forward<K>(key), std::forward<V>(value)).first;
+  }
+  template <class V>
+  std::pair<iterator, bool> insert_or_assign(std::string_view key, V&& value) {
+    auto [it, inserted] = try_emplace(key);
+    it->second = Value(std::forward<V>(value));
+    return {it, inserted};
+  }
+  template <class Pair>
+  requires requires(const Pair& p) {
+    p.first;
+    p.second;
+  }
+  std::pair<iterator, bool> insert(Pair&& entry) {
+    return try_emplace(std::string_view(keyView(entry.first)), std::forward<Pair>(entry).second);
+  }
+  template <class InputIt>
+  void insert(InputIt first, InputIt last) {
+    for (; first != last; ++first) insert(*first);
+  }
+  iterator erase(const_iterator position);
+  size_type erase(std::string_view key);
+
+  friend bool operator==(const Dictionary& a, const Dictionary& b) noexcept;
+
+ private:
+  friend class detail::DocumentBuilder;
+  static std::string_view keyView(const String& key) noexcept { return key.view(); }
+  static std::string_view keyView(std::string_view key) noexcept { return key; }
+  static std::string_view keyView(const std::string& key) noexcept { return key; }
+  static std::string_view keyView(const char* key) noexcept { return key ? key : ""; }
+  iterator insertAt(std::ptrdiff_t index, String key, Value value);
+  void adopt(std::vector<DictionaryEntry> entries, bool lastWins);
+  void makeOwn();
+
+  DictionaryEntry* data_ = nullptr;
+  std::uint32_t size_ = 0;
+  std::uint32_t capacity_ = 0;
+  bool borrowed_ = false;  // the entries belong to a document's arena
+};
+
+template <class... Args>
+Value& Array::emplace_back(Args&&... args) {
+  Value value(std::forward<Args>(args)...);  // may refer to an element: made first
+  if (size_ == capacity_ || borrowed_) grow(size_ + 1);
+  Value* slot = new (data_ + size_) Value(std::move(value));
+  ++size_;
+  return *slot;
+}
 
 }  // namespace kivi

@@ -101,7 +101,7 @@ class OptionalKey {
 // when the key is missing or its value is of another kind. The pointers point
 // into `dictionary` and live as long as it does.
 
-const std::string* jsonStringForKey(const Dictionary& dictionary, OptionalKey key);
+const String* jsonStringForKey(const Dictionary& dictionary, OptionalKey key);
 // Booleans included.
 std::optional<Number> jsonNumberForKey(const Dictionary& dictionary, OptionalKey key);
 // jsonNumberForKey not zero; false when there is no number.

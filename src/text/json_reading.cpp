@@ -1,26 +1,22 @@
-// JSON reading and writing.
+// JSON reading.
 //
 // Reading has two paths. The fast one parses with simdjson's DOM parser (a
 // parser per thread, reused) and converts its tape to Values with an explicit
-// stack. simdjson reports only an error code, so when it refuses a text the
-// careful path reads the same text again with nlohmann::json's SAX parser,
-// which says where it stopped, and turns that into a message with a line and
-// column. The careful path also reads the integers simdjson refuses (beyond
-// 64 bits), which become doubles.
+// stack, straight into one arena for the whole document. simdjson reports
+// only an error code, so when it refuses a text the careful path reads the
+// same text again with nlohmann::json's SAX parser, which says where it
+// stopped, and turns that into a message with a line and column. The careful
+// path also reads the integers simdjson refuses (beyond 64 bits), which
+// become doubles.
 //
-// Both readers and the writer use explicit stacks: nothing here recurses on
-// the nesting of a document or a Value.
-#include "kivi/text/json_serialization.h"
-
+// Neither reader recurses on the nesting of a document.
 #include <simdjson.h>
 
 #include <algorithm>
-#include <array>
-#include <charconv>
-#include <cmath>
 #include <cstdint>
 #include <cstdio>
 #include <cstring>
+#include <iterator>
 #include <limits>
 #include <nlohmann/json.hpp>
 #include <optional>
@@ -28,21 +24,13 @@
 #include <utility>
 #include <vector>
 
+#include "json_common.h"
+#include "kivi/base/detail/document_builder.h"
 #include "kivi/base/object.h"
-
+#include "kivi/text/json_serialization.h"
 namespace kivi {
-namespace {
 
-constexpr const char* kReadFailure =
-    "The data couldn\u2019t be read because it isn\u2019t in the correct format.";
-constexpr const char* kWriteFailure =
-    "The data couldn\u2019t be written because it isn\u2019t in the correct format.";
-constexpr const char* kNotAContainer =
-    "JSON text did not start with array or object and option to allow fragments not set.";
-
-// A thread's parser keeps its buffers between calls, unless a text this big
-// made them grow: that one gets a parser of its own, freed on return.
-constexpr std::size_t kLargestReusedCapacity = std::size_t{8} << 20;
+namespace json_detail {
 
 ErrorPtr makeError(std::int64_t code, const char* description, std::string debugDescription) {
   Dictionary userInfo;
@@ -51,74 +39,80 @@ ErrorPtr makeError(std::int64_t code, const char* description, std::string debug
   return Error::create(CocoaErrorDomain, code, std::move(userInfo));
 }
 
+}  // namespace json_detail
+
+namespace {
+
+using json_detail::kNotAContainer;
+using json_detail::kReadFailure;
+using json_detail::makeError;
+
+// A thread's parser keeps its buffers between calls, unless a text this big
+// made them grow: that one gets a parser of its own, freed on return.
+constexpr std::size_t kLargestReusedCapacity = std::size_t{8} << 20;
+
 // ---------------------------------------------------------------------------
 // The fast reader
 
-// Converts simdjson's document to a Value. simdjson counts an empty
-// innermost container as no level, so the parser runs with one level to
-// spare and the converter applies the limit: false when the document is
-// deeper than kMaxDepth.
+// Converts simdjson's document to a Value built in one arena. simdjson
+// counts an empty innermost container as no level, so the parser runs with
+// one level to spare and the converter applies the limit: false when the
+// document is deeper than kMaxDepth.
 class TapeConverter {
  public:
   static constexpr std::size_t kParserMaxDepth = JSONSerialization::kMaxDepth + 1;
 
+  explicit TapeConverter(std::size_t sizeHint) : builder_(sizeHint) {}
+
   bool convert(simdjson::dom::element root, Value& out) {
     if (!isContainer(root)) {
-      scalar(root, [&](auto&& value) { out = Value(std::forward<decltype(value)>(value)); });
+      scalar(root, builder_.root());
+      out = builder_.finish();
       return true;
     }
-    open(root, {});
-    for (;;) {
+    if (!open(root, builder_.root())) return false;
+    while (!stack_.empty()) {
       Frame& f = stack_.back();
       if (f.isObject) {
         if (f.member != f.membersEnd) {
-          const std::string_view key = f.member.key();
+          DictionaryEntry& entry = f.entries[f.index++];
+          builder_.setKey(entry.first, f.member.key());
           const simdjson::dom::element element = f.member.value();
           ++f.member;
           if (!isContainer(element)) {
-            scalar(element, [&](auto&& value) {
-              addMember(f.dictionary, key, std::forward<decltype(value)>(value));
-            });
-          } else if (!open(element, key)) {
+            scalar(element, entry.second);
+          } else if (!open(element, entry.second)) {  // f is stale after
             return false;
           }
           continue;
         }
+        builder_.finishDictionary(*f.slot);
       } else if (f.element != f.elementsEnd) {
+        Value& slot = f.values[f.index++];
         const simdjson::dom::element element = *f.element;
         ++f.element;
         if (!isContainer(element)) {
-          scalar(element,
-                 [&](auto&& value) { f.array.emplace_back(std::forward<decltype(value)>(value)); });
-        } else if (!open(element, {})) {
+          scalar(element, slot);
+        } else if (!open(element, slot)) {
           return false;
         }
         continue;
       }
-      Value done = f.isObject ? Value(std::move(f.dictionary)) : Value(std::move(f.array));
-      const std::string_view key = f.key;
       stack_.pop_back();
-      if (stack_.empty()) {
-        out = std::move(done);
-        return true;
-      }
-      Frame& parent = stack_.back();
-      if (parent.isObject) {
-        addMember(parent.dictionary, key, std::move(done));
-      } else {
-        parent.array.push_back(std::move(done));
-      }
     }
+    out = builder_.finish();
+    return true;
   }
 
  private:
   struct Frame {
     bool isObject = false;
+    Value* slot = nullptr;  // the container's own place
+    std::size_t index = 0;  // of the next member or element
+    Value* values = nullptr;
+    DictionaryEntry* entries = nullptr;
     simdjson::dom::array::iterator element, elementsEnd;
     simdjson::dom::object::iterator member, membersEnd;
-    Array array;
-    Dictionary dictionary;
-    std::string_view key;  // under which the container goes in its parent object
   };
 
   static bool isContainer(simdjson::dom::element e) {
@@ -127,57 +121,57 @@ class TapeConverter {
            type == simdjson::dom::element_type::OBJECT;
   }
 
-  template <class T>
-  static void addMember(Dictionary& dictionary, std::string_view key, T&& value) {
-    // The last of duplicate keys wins.
-    auto [it, inserted] = dictionary.try_emplace(std::string(key), std::forward<T>(value));
-    if (!inserted) it->second = Value(std::forward<T>(value));
+  // simdjson's counts stop at 0xFFFFFF; a container that large is counted.
+  template <class Container>
+  static std::size_t countOf(Container c) {
+    const std::size_t n = c.size();
+    return n < 0xFFFFFF ? n : static_cast<std::size_t>(std::distance(c.begin(), c.end()));
   }
 
-  // Passes the scalar e to add(), made in place where it goes.
-  template <class Add>
-  static void scalar(simdjson::dom::element e, Add&& add) {
+  void scalar(simdjson::dom::element e, Value& slot) {
     using simdjson::dom::element_type;
     switch (e.type()) {
       case element_type::STRING:
-        add(std::string(e.get_string().value_unsafe()));
+        builder_.setString(slot, e.get_string().value_unsafe());
         break;
       case element_type::INT64:
-        add(Number(e.get_int64().value_unsafe()));
+        detail::DocumentBuilder::setNumber(slot, Number(e.get_int64().value_unsafe()));
         break;
       case element_type::UINT64:
-        add(Number(e.get_uint64().value_unsafe()));
+        detail::DocumentBuilder::setNumber(slot, Number(e.get_uint64().value_unsafe()));
         break;
       case element_type::DOUBLE:
-        add(Number(e.get_double().value_unsafe()));
+        detail::DocumentBuilder::setNumber(slot, Number(e.get_double().value_unsafe()));
         break;
       case element_type::BOOL:
-        add(Number(e.get_bool().value_unsafe()));
+        detail::DocumentBuilder::setNumber(slot, Number(e.get_bool().value_unsafe()));
         break;
       default:
-        add(Null{});
+        detail::DocumentBuilder::setNull(slot);
         break;
     }
   }
 
-  bool open(simdjson::dom::element e, std::string_view key) {
+  bool open(simdjson::dom::element e, Value& slot) {
     if (stack_.size() == JSONSerialization::kMaxDepth) return false;
     Frame& f = stack_.emplace_back();
-    f.key = key;
+    f.slot = &slot;
     if (e.type() == simdjson::dom::element_type::OBJECT) {
       const simdjson::dom::object object = e.get_object().value_unsafe();
       f.isObject = true;
       f.member = object.begin();
       f.membersEnd = object.end();
+      f.entries = builder_.makeDictionary(slot, countOf(object));
     } else {
       const simdjson::dom::array array = e.get_array().value_unsafe();
       f.element = array.begin();
       f.elementsEnd = array.end();
-      f.array.reserve(array.size());
+      f.values = builder_.makeArray(slot, countOf(array));
     }
     return true;
   }
 
+  detail::DocumentBuilder builder_;
   std::vector<Frame> stack_;
 };
 
@@ -348,7 +342,7 @@ class ValueBuilder {
     return add(u <= kInt64Max ? Value(Number(static_cast<std::int64_t>(u))) : Value(Number(u)));
   }
   bool number_float(double d, const std::string&) { return add(Value(Number(d))); }
-  bool string(std::string& s) { return add(Value(std::move(s))); }
+  bool string(std::string& s) { return add(Value(s)); }
   bool binary(nlohmann::json::binary_t&) { return false; }  // never in JSON text
   bool start_object(std::size_t) { return open(true); }
   bool start_array(std::size_t) { return open(false); }
@@ -368,8 +362,8 @@ class ValueBuilder {
   struct Container {
     bool isObject;
     Array array;
-    Dictionary dictionary;
-    std::string key;  // of the member being read, in an object
+    std::vector<DictionaryEntry> members;  // sorted once, at the end
+    std::string key;                       // of the member being read, in an object
   };
 
   bool open(bool isObject) {
@@ -382,7 +376,8 @@ class ValueBuilder {
   }
   bool close() {
     Container& top = stack_.back();
-    Value done = top.isObject ? Value(std::move(top.dictionary)) : Value(std::move(top.array));
+    Value done = top.isObject ? Value(Dictionary(std::move(top.members), /*lastWins=*/true))
+                              : Value(std::move(top.array));
     stack_.pop_back();
     return add(std::move(done));
   }
@@ -390,7 +385,7 @@ class ValueBuilder {
     if (stack_.empty()) {
       value_ = std::move(value);
     } else if (Container& top = stack_.back(); top.isObject) {
-      top.dictionary.insert_or_assign(std::move(top.key), std::move(value));  // the last one wins
+      top.members.push_back(DictionaryEntry{String(top.key), std::move(value)});
     } else {
       top.array.push_back(std::move(value));
     }
@@ -432,308 +427,7 @@ class ValueBuilder {
   }
   return std::move(builder.value());
 }
-
-// ---------------------------------------------------------------------------
-// The writer
-
-constexpr double kLargestExactInteger = 9007199254740992.0;  // 2^53
-
-// Walks a Value with an explicit stack, checking it can be written as JSON
-// and, when kEmit, writing it.
-template <bool kEmit>
-class Writer {
- public:
-  // Writes into `buffer` from its start, growing it as needed; it may end up
-  // larger than the text (see size()).
-  Writer(JSONWritingOptions options, Data* buffer)
-      : pretty_((options & JSONWritingPrettyPrinted) != 0),
-        fragmentsAllowed_((options & JSONWritingFragmentsAllowed) != 0),
-        escapeSlashes_((options & JSONWritingWithoutEscapingSlashes) == 0),
-        buffer_(buffer) {}
-
-  bool write(const Value& root);
-  std::size_t size() const { return used_; }
-  const std::string& message() const { return message_; }
-
- private:
-  struct Frame {
-    const Array* array;
-    const Dictionary* dictionary;
-    std::size_t index;
-    Dictionary::const_iterator member;
-  };
-
-  bool fail(std::string message) {
-    message_ = std::move(message);
-    return false;
-  }
-  // Room for n more bytes; advance() by what was written there.
-  char* room(std::size_t n) {
-    if (used_ + n > buffer_->size()) {
-      buffer_->resize(std::max({buffer_->size() * 2, used_ + n, std::size_t{256}}));
-    }
-    return reinterpret_cast<char*>(buffer_->data()) + used_;
-  }
-  void advance(const char* end) {
-    used_ = static_cast<std::size_t>(end - reinterpret_cast<const char*>(buffer_->data()));
-  }
-  void put(char c) {
-    if constexpr (kEmit) {
-      *room(1) = c;
-      ++used_;
-    }
-  }
-  void put(std::string_view s) {
-    if constexpr (kEmit) {
-      std::memcpy(room(s.size()), s.data(), s.size());
-      used_ += s.size();
-    }
-  }
-  void newline(std::size_t depth) {
-    if constexpr (kEmit) {
-      if (!pretty_) return;
-      char* p = room(1 + 2 * depth);
-      *p = '\n';
-      std::memset(p + 1, ' ', 2 * depth);
-      used_ += 1 + 2 * depth;
-    }
-  }
-
-  // Containers and long strings are blocks elsewhere in memory: fetching the
-  // next one while writing this one hides much of the wait for it.
-  static void prefetch(const Value& next) {
-    __builtin_prefetch(&next);
-    if (const Dictionary* d = next.asDictionary()) {
-      __builtin_prefetch(d);
-    } else if (const Array* a = next.asArray()) {
-      __builtin_prefetch(a);
-    } else if (const std::string* s = next.asString()) {
-      __builtin_prefetch(s->data());
-    }
-  }
-
-  bool writeValue(const Value& value);
-  bool writeNumber(const Number& number);
-  bool writeString(std::string_view s);
-
-  bool pretty_;
-  bool fragmentsAllowed_;
-  bool escapeSlashes_;
-  Data* buffer_;
-  std::size_t used_ = 0;
-  std::vector<Frame> stack_;
-  std::string message_;
-};
-
-template <bool kEmit>
-bool Writer<kEmit>::write(const Value& root) {
-  const Value::Kind kind = root.kind();
-  if (!fragmentsAllowed_ && kind != Value::Kind::Array && kind != Value::Kind::Dictionary) {
-    return fail("Invalid top-level type in JSON write.");
-  }
-  if (!writeValue(root)) return false;
-  while (!stack_.empty()) {
-    Frame& f = stack_.back();
-    const std::size_t depth = stack_.size();
-    if (f.array != nullptr) {
-      if (f.index < f.array->size()) {
-        if (f.index != 0) put(',');
-        newline(depth);
-        const Value& element = (*f.array)[f.index++];
-        if (f.index < f.array->size()) prefetch((*f.array)[f.index]);
-        if (!writeValue(element)) return false;  // may push: f is stale after
-        continue;
-      }
-      newline(depth - 1);
-      put(']');
-    } else {
-      if (f.member != f.dictionary->end()) {
-        if (f.member != f.dictionary->begin()) put(',');
-        newline(depth);
-        const auto& [key, value] = *f.member++;
-        if (f.member != f.dictionary->end()) prefetch(f.member->second);
-        if (!writeString(key)) return false;
-        if (pretty_) {
-          put(" : ");
-        } else {
-          put(':');
-        }
-        if (!writeValue(value)) return false;
-        continue;
-      }
-      newline(depth - 1);
-      put('}');
-    }
-    stack_.pop_back();
-  }
-  return true;
-}
-
-template <bool kEmit>
-bool Writer<kEmit>::writeValue(const Value& value) {
-  switch (value.kind()) {
-    case Value::Kind::Null:
-      put("null");
-      return true;
-    case Value::Kind::Number:
-      return writeNumber(*value.asNumber());
-    case Value::Kind::String:
-      return writeString(*value.asString());
-    case Value::Kind::Array:
-    case Value::Kind::Dictionary: {
-      if (stack_.size() == JSONSerialization::kMaxDepth) {
-        return fail("Too deeply nested in JSON write (more than " +
-                    std::to_string(JSONSerialization::kMaxDepth) + " levels).");
-      }
-      const Array* array = value.asArray();
-      const Dictionary* dictionary = value.asDictionary();
-      if (array != nullptr ? array->empty() : dictionary->empty()) {
-        put(array != nullptr ? "[]" : "{}");
-        return true;
-      }
-      put(array != nullptr ? '[' : '{');
-      stack_.push_back(
-          Frame{array, dictionary, 0,
-                dictionary != nullptr ? dictionary->begin() : Dictionary::const_iterator{}});
-      return true;
-    }
-    case Value::Kind::Data:
-      return fail("Invalid type in JSON write (NSData).");
-    case Value::Kind::Date:
-      return fail("Invalid type in JSON write (NSDate).");
-    case Value::Kind::URL:
-      return fail("Invalid type in JSON write (NSURL).");
-    case Value::Kind::Object:
-      return fail("Invalid type in JSON write (" + (*value.asObject())->className() + ").");
-  }
-  return fail("Invalid type in JSON write.");
-}
-
-template <bool kEmit>
-bool Writer<kEmit>::writeNumber(const Number& number) {
-  if (number.isBool()) {
-    put(number.boolValue() ? std::string_view("true") : std::string_view("false"));
-    return true;
-  }
-  const double d = number.doubleValue();
-  if (number.type() == Number::Type::Double) {
-    if (std::isnan(d)) return fail("Invalid number value (NaN) in JSON write.");
-    if (std::isinf(d)) return fail("Invalid number value (infinite) in JSON write.");
-  }
-  if constexpr (kEmit) {
-    char* p = room(32);
-    char* end = p + 32;
-    std::to_chars_result result{p, {}};
-    if (number.type() == Number::Type::Int) {
-      result = std::to_chars(p, end, number.longLongValue());
-    } else if (number.type() == Number::Type::UInt) {
-      result = std::to_chars(p, end, number.unsignedLongLongValue());
-    } else if (d == 0 && std::signbit(d)) {
-      result.ptr = std::copy_n("-0", 2, p);
-    } else if (std::trunc(d) != d) {
-      result = std::to_chars(p, end, d);
-    } else if (std::fabs(d) <= kLargestExactInteger) {
-      result = std::to_chars(p, end, static_cast<std::int64_t>(d));
-    } else {
-      // Beyond 2^53 an integral double is written with an exponent so that
-      // it reads back as a double, not as an integer (or one too long).
-      result = std::to_chars(p, end, d, std::chars_format::scientific);
-    }
-    advance(result.ptr);
-  }
-  return true;
-}
-
-// What a byte is written as inside a string: 0 as itself, 'u' as \u00XX,
-// otherwise a backslash and this character.
-constexpr auto kEscapes = [] {
-  std::array<char, 256> table{};
-  for (int c = 0; c < 0x20; ++c) table[c] = 'u';
-  table['\b'] = 'b';
-  table['\f'] = 'f';
-  table['\n'] = 'n';
-  table['\r'] = 'r';
-  table['\t'] = 't';
-  table['"'] = '"';
-  table['\\'] = '\\';
-  table['/'] = '/';
-  return table;
-}();
-
-template <bool kEmit>
-bool Writer<kEmit>::writeString(std::string_view s) {
-  const auto* p = reinterpret_cast<const unsigned char*>(s.data());
-  const auto* end = p + s.size();
-  unsigned char seen = 0;
-  if constexpr (kEmit) {
-    put('"');
-    while (p != end) {
-      // A piece at a time, so that a long string never asks for six times
-      // its size.
-      const auto* pieceEnd = p + std::min<std::size_t>(static_cast<std::size_t>(end - p), 4096);
-      char* out = room(6 * static_cast<std::size_t>(pieceEnd - p));  // a byte may take six
-      for (; p != pieceEnd; ++p) {
-        const unsigned char c = *p;
-        seen |= c;
-        const char escape = kEscapes[c];
-        if (escape == 0 || (c == '/' && !escapeSlashes_)) {
-          *out++ = static_cast<char>(c);
-        } else if (escape == 'u') {
-          static constexpr char kHex[] = "0123456789abcdef";
-          out = std::copy_n("\\u00", 4, out);
-          *out++ = kHex[c >> 4];
-          *out++ = kHex[c & 0xF];
-        } else {
-          *out++ = '\\';
-          *out++ = escape;
-        }
-      }
-      advance(out);
-    }
-    put('"');
-  } else {
-    for (; p != end; ++p) seen |= *p;
-  }
-  if ((seen & 0x80) != 0 && !simdjson::validate_utf8(s.data(), s.size())) {
-    return fail("Invalid UTF-8 in string in JSON write.");
-  }
-  return true;
-}
-
 }  // namespace
-
-bool JSONSerialization::isValidJSONObject(const Value& value) {
-  return Writer<false>(0, nullptr).write(value);
-}
-
-std::optional<Data> JSONSerialization::dataWithJSONObject(const Value& value,
-                                                          JSONWritingOptions options,
-                                                          ErrorPtr* error) {
-  // Texts are written into a buffer the thread keeps (unless it is in use,
-  // or grew too large to keep) and copied out at their exact size.
-  thread_local Data threadBuffer;
-  thread_local bool threadBufferInUse = false;
-  Data ownBuffer;
-  Data* buffer = threadBufferInUse ? &ownBuffer : &threadBuffer;
-  const bool usingThreadBuffer = buffer == &threadBuffer;
-  if (usingThreadBuffer) threadBufferInUse = true;
-
-  Writer<true> writer(options, buffer);
-  const bool written = writer.write(value);
-  std::optional<Data> text;
-  if (written) text.emplace(buffer->begin(), buffer->begin() + writer.size());
-
-  if (usingThreadBuffer) {
-    threadBufferInUse = false;
-    if (threadBuffer.size() > kLargestReusedCapacity) Data().swap(threadBuffer);
-  }
-  if (!written) {
-    if (error) *error = makeError(PropertyListWriteInvalidError, kWriteFailure, writer.message());
-    return std::nullopt;
-  }
-  if (error) *error = nullptr;
-  return text;
-}
 
 std::optional<Value> JSONSerialization::JSONObjectWithData(std::string_view data,
                                                            JSONReadingOptions options,
@@ -756,7 +450,7 @@ std::optional<Value> JSONSerialization::JSONObjectWithData(std::string_view data
   simdjson::dom::element root;
   if (code == simdjson::SUCCESS) code = parser->parse(data.data(), data.size()).get(root);
   Value value;
-  if (code == simdjson::SUCCESS && TapeConverter().convert(root, value)) {
+  if (code == simdjson::SUCCESS && TapeConverter(data.size()).convert(root, value)) {
     if (!fragmentsAllowed && value.kind() != Value::Kind::Array &&
         value.kind() != Value::Kind::Dictionary) {
       return refuse(kNotAContainer);
@@ -778,5 +472,4 @@ std::optional<Value> JSONSerialization::JSONObjectWithData(std::string_view data
   if (error) *error = nullptr;
   return careful;
 }
-
 }  // namespace kivi
