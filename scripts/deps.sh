@@ -1,10 +1,25 @@
 #!/usr/bin/env bash
 # Makes sure the Debian packages the build needs are installed.
 #
+#   scripts/deps.sh           what the library, tests, benchmarks and fuzzers need
+#   scripts/deps.sh --peers   also the libraries the peer benchmark compares
+#                             against (scripts/peer_bench.py)
+#
 # Prints nothing and returns 0 when they all are. Otherwise, as root, installs
 # the missing ones with apt-get; as any other user, prints the apt-get line to
 # run and exits 1.
 set -euo pipefail
+
+peers=0
+for argument; do
+  case $argument in
+    --peers) peers=1 ;;
+    *)
+      echo "usage: scripts/deps.sh [--peers]" >&2
+      exit 2
+      ;;
+  esac
+done
 
 # Everything the build, the tests, the benchmarks and the fuzzers need.
 #   libclang-rt-14-dev: libFuzzer and the sanitizer runtimes for clang.
@@ -33,6 +48,11 @@ PACKAGES=(
   openssl
   libglib2.0-dev
 )
+# The peer benchmark's other clients and JSON readers (Qt 6 Core and Network,
+# POCO Net and NetSSL, RapidJSON); never needed by the library or its tests.
+if ((peers)); then
+  PACKAGES+=(qt6-base-dev libpoco-dev rapidjson-dev)
+fi
 
 # Prints the packages among the arguments that are not installed.
 missing_packages() {

@@ -10,6 +10,7 @@
 #include "kivi/dispatch/detail/main_queue.h"
 #include "kivi/dispatch/thread.h"
 #include "kivi/dispatch/worker_pool.h"
+#include "latch.h"
 
 namespace kivi {
 
@@ -23,18 +24,15 @@ using RunningScope = detail::CurrentQueueScope;
 // Passes a queue to a thread waiting in sync(). Shared, so that the thread
 // that gives it never touches memory the waiter has already left.
 struct Handoff {
-  std::atomic<bool> yours{false};
+  detail::Latch yours;
   // Concurrent queues: the batch the waiter's work belongs to, held while
   // it runs.
   std::shared_ptr<const void> token;
 
-  void give() {
-    yours.store(true, std::memory_order_release);
-    yours.notify_one();
-  }
+  void give() { yours.set(); }
   void await() {
     WorkerPool::BlockingScope blocking;
-    yours.wait(false, std::memory_order_acquire);
+    yours.wait();
   }
 };
 

@@ -147,10 +147,10 @@ void Operation::setName(std::string name) {
 }
 
 void Operation::waitUntilFinished() {
-  if (state().finishDelivered.load(std::memory_order_acquire)) return;
+  if (state().finishDelivered.isSet()) return;
   // A futex of this operation's own: finishing wakes only its waiters.
   WorkerPool::BlockingScope blocking;
-  state().finishDelivered.wait(false, std::memory_order_acquire);
+  state().finishDelivered.wait();
 }
 
 Value Operation::valueForKey(std::string_view key) const {
@@ -207,10 +207,7 @@ void Operation::didFinish() {
   if (!core || core->operationFinished(*this)) deliverFinish();
 }
 
-void Operation::deliverFinish() {
-  state().finishDelivered.store(true, std::memory_order_release);
-  state().finishDelivered.notify_all();
-}
+void Operation::deliverFinish() { state().finishDelivered.set(); }
 
 void BlockOperation::main() {
   if (block_) block_();

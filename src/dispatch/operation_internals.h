@@ -14,6 +14,7 @@
 #include <vector>
 
 #include "kivi/dispatch/operation.h"
+#include "latch.h"
 
 namespace kivi::detail {
 
@@ -46,7 +47,7 @@ struct OperationState {
   std::atomic<bool> refusedNotReady{false};
   std::atomic<bool> finishHandled{false};
   // Set, and waiters woken, once everything finishing entails is done.
-  std::atomic<bool> finishDelivered{false};
+  detail::Latch finishDelivered;
   std::atomic<bool> enqueued{false};
   // Its queue has called start(): readiness no longer matters to the queue.
   std::atomic<bool> queueStarted{false};

@@ -253,6 +253,9 @@ struct URLSessionCore : std::enable_shared_from_this<URLSessionCore> {
   Clock::time_point curlDeadline = Clock::time_point::max();
   Clock::time_point idleCheck = Clock::time_point::max();  // no transfer goes idle before
   Clock::time_point connectionsExpire = Clock::time_point::max();
+  // Easy handles of ended transfers, reset and kept for the next ones: making
+  // one is a large zeroed allocation and a dozen more.
+  std::vector<CURL*> spareEasy;
   std::unique_ptr<DispatchTimer> curlTimer;     // fires at curlDeadline
   std::unique_ptr<DispatchTimer> sessionTimer;  // fires at idleCheck or connectionsExpire
   Clock::time_point curlArmed = Clock::time_point::max();
@@ -262,6 +265,8 @@ struct URLSessionCore : std::enable_shared_from_this<URLSessionCore> {
   void requestCancel(std::uint64_t taskIdentifier);
   void invalidate(bool cancelRunning);
   bool configure(Transfer& transfer);
+  CURL* takeEasy();
+  void recycleEasy(CURL* easy);
   void complete(std::unique_ptr<Transfer> transfer, std::optional<Data> data,
                 HTTPURLResponsePtr response, ErrorPtr error);
   void finish(Ended ended);
@@ -409,6 +414,34 @@ URLSessionCore::~URLSessionCore() {
   // Transfers hold the core through their task, so none is left by now.
   std::lock_guard lock(mutex);
   releaseMultiLocked();
+  for (CURL* easy : spareEasy) curl_easy_cleanup(easy);
+}
+
+CURL* URLSessionCore::takeEasy() {
+  {
+    std::lock_guard lock(mutex);
+    if (!spareEasy.empty()) {
+      CURL* easy = spareEasy.back();
+      spareEasy.pop_back();
+      return easy;
+    }
+  }
+  return curl_easy_init();
+}
+
+void URLSessionCore::recycleEasy(CURL* easy) {
+  if (!easy) return;
+  curl_easy_reset(easy);  // every option back to its default; caches stay with the multi handle
+  {
+    std::lock_guard lock(mutex);
+    const auto kept = static_cast<std::size_t>(
+        std::max<std::int64_t>(1, configuration.HTTPMaximumConnectionsPerHost) * 2);
+    if (spareEasy.size() < kept) {
+      spareEasy.push_back(easy);
+      return;
+    }
+  }
+  curl_easy_cleanup(easy);
 }
 
 bool URLSessionCore::makeMultiLocked() {
@@ -438,7 +471,7 @@ void URLSessionCore::releaseMultiLocked() {
 
 bool URLSessionCore::configure(Transfer& t) {
   const URLRequest& request = t.request;
-  CURL* easy = curl_easy_init();
+  CURL* easy = takeEasy();
   if (!easy) return false;
   t.easy = easy;
   curl_easy_setopt(easy, CURLOPT_PRIVATE, &t);
@@ -667,7 +700,8 @@ void URLSessionCore::complete(std::unique_ptr<Transfer> transfer, std::optional<
                               HTTPURLResponsePtr response, ErrorPtr error) {
   URLSessionTaskPtr task = std::move(transfer->task);
   auto completion = std::move(transfer->completion);
-  transfer.reset();                          // frees the easy handle on this thread
+  recycleEasy(std::exchange(transfer->easy, nullptr));  // out of the multi handle by now
+  transfer.reset();
   std::shared_ptr<URLSessionCore> released;  // dropped after the task's lock
   {
     // Under the task's lock, so that a cancel() deciding on the state cannot

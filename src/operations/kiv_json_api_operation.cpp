@@ -142,14 +142,16 @@ void KivJSONAPIOperation::didCompleteUrlRequest(const URLRequest&, const std::op
 std::optional<URLRequest> KivJSONAPIOperation::createURLRequestWithError(ErrorPtr* error) {
   writeSlot(error, nullptr);
   if (!restApiURL()) return std::nullopt;
-  URLComponents components = URLComponents::fromURL(*restApiURL());
+  URLPtr url = restApiURL();
+  // Only added query items take the URL apart and put it together again.
   if (auto parameters = additionalQueryParameters(); parameters && !parameters->empty()) {
+    URLComponents components = URLComponents::fromURL(*url);
     std::vector<URLQueryItem> items;
     items.reserve(parameters->size());
     for (const auto& [name, value] : *parameters) items.push_back({name, value});
     KiviOSSdkUtils::addQueryItems(components, items);
+    url = components.url();
   }
-  URLPtr url = components.url();
   if (!url) return std::nullopt;
   MutableURLRequest request(std::move(url), DefaultJSONAPITimeout);
   request.setHTTPMethod(httpMethod());

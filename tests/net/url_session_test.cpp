@@ -79,7 +79,9 @@ TEST_F(URLSessionTest, SendsTheRequestAndDeliversTheAnswer) {
   } cases[] = {{"GET", "/status/200", "/status/200"},
                {"GET", "/redirect", "/status/200"},
                {"POST", "/post", "/post"},
-               {"PUT", "/put", "/put"}};
+               {"PUT", "/put", "/put"},
+               // The session reuses libcurl handles: nothing of the PUT may stay.
+               {"GET", "/status/200", "/status/200"}};
   for (const auto& c : cases) {
     SCOPED_TRACE(c.path);
     MutableURLRequest sent(URL::URLWithString(http.url(c.path)));
