@@ -47,6 +47,7 @@ bool keyLess(const DictionaryEntry& a, const DictionaryEntry& b) noexcept {
 
 // Sorts entries by key, keeping the order of equal keys.
 void stableSortByKey(DictionaryEntry* first, DictionaryEntry* last) {
+  if (last - first < 2) return;  // (an empty vector's entries may be null)
   if (last - first <= 24) {
     for (DictionaryEntry* i = first + 1; i < last; ++i) {
       if (!keyLess(*i, i[-1])) continue;

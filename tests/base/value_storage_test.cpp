@@ -70,6 +70,7 @@ TEST(ValueStorage, DictionariesAreSortedByBytesAndResolveDuplicateKeys) {
   EXPECT_EQ(literal.at("b"), Value(1));
   EXPECT_EQ(*read(R"({"b":1,"a":2,"b":3})").find("b"), Value(3));
   EXPECT_EQ(*read(R"([{"b":1,"a":2,"b":3},18446744073709551616])").at(0)->find("b"), Value(3));
+  EXPECT_TRUE(read(R"([{},18446744073709551616])").at(0)->asDictionary()->empty());
   // The same layout again (the reader remembers layouts) and a new one.
   const Value records = read(R"([{"z":1,"é":2,"B":3,"a":4},{"z":5,"é":6,"B":7,"a":8},
                                  {"z":9,"é":10,"B":11,"a":12,"a":13}])");
