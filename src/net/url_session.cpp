@@ -4,12 +4,6 @@
 
 namespace kivi {
 
-using url_session_detail::cancelledError;
-using url_session_detail::hasLineBreakOrNul;
-using url_session_detail::headerText;
-using url_session_detail::isToken;
-using url_session_detail::makeURLError;
-
 namespace {
 std::atomic<std::uint64_t> gNextTaskIdentifier{1};
 }  // namespace

@@ -64,12 +64,6 @@ ErrorPtr cancelledError(const URLPtr& url) {
 
 }  // namespace url_session_detail
 
-using url_session_detail::cancelledError;
-using url_session_detail::hasLineBreakOrNul;
-using url_session_detail::headerText;
-using url_session_detail::isToken;
-using url_session_detail::makeURLError;
-
 namespace {
 
 // How long a connection is kept without being used.

@@ -42,8 +42,13 @@ inline std::string environment(const char* name) {
 
 }  // namespace url_session_detail
 
+using url_session_detail::cancelledError;
 using url_session_detail::Clock;
 using url_session_detail::environment;
+using url_session_detail::hasLineBreakOrNul;
+using url_session_detail::headerText;
+using url_session_detail::isToken;
+using url_session_detail::makeURLError;
 
 // One request, from resume() until its completion is handed to the delegate
 // queue. While the transfer is in the multi handle, libcurl's callbacks write
