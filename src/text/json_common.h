@@ -16,6 +16,10 @@ inline constexpr const char* kWriteFailure =
 inline constexpr const char* kNotAContainer =
     "JSON text did not start with array or object and option to allow fragments not set.";
 
+// The thread's reader and writer buffers are not kept after a text this
+// large.
+inline constexpr std::size_t kLargestReusedCapacity = std::size_t{8} << 20;
+
 // A Cocoa-domain error with the platform's description and ours.
 ErrorPtr makeError(std::int64_t code, const char* description, std::string debugDescription);
 

@@ -47,9 +47,7 @@ using json_detail::kNotAContainer;
 using json_detail::kReadFailure;
 using json_detail::makeError;
 
-// A thread's parser keeps its buffers between calls, unless a text this big
-// made them grow: that one gets a parser of its own, freed on return.
-constexpr std::size_t kLargestReusedCapacity = std::size_t{8} << 20;
+using json_detail::kLargestReusedCapacity;
 
 // ---------------------------------------------------------------------------
 // The fast reader

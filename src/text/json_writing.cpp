@@ -24,8 +24,7 @@ namespace {
 using json_detail::kWriteFailure;
 using json_detail::makeError;
 
-// The thread's buffer is dropped after a text larger than this.
-constexpr std::size_t kLargestReusedCapacity = std::size_t{8} << 20;
+using json_detail::kLargestReusedCapacity;
 
 // ---------------------------------------------------------------------------
 // The writer

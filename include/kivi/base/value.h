@@ -204,9 +204,25 @@ class String {
     std::memcpy(other.bytes_, t, sizeof t);
   }
 
+  // One overload per argument type, so that no comparison needs a
+  // conversion that could go two ways.
+  friend bool operator==(const String& a, const String& b) noexcept { return a.view() == b.view(); }
   friend bool operator==(const String& a, std::string_view b) noexcept { return a.view() == b; }
+  friend bool operator==(const String& a, const std::string& b) noexcept { return a.view() == b; }
+  friend bool operator==(const String& a, const char* b) noexcept {
+    return a.view() == std::string_view(b ? b : "");
+  }
+  friend std::strong_ordering operator<=>(const String& a, const String& b) noexcept {
+    return a.view().compare(b.view()) <=> 0;
+  }
   friend std::strong_ordering operator<=>(const String& a, std::string_view b) noexcept {
     return a.view().compare(b) <=> 0;
+  }
+  friend std::strong_ordering operator<=>(const String& a, const std::string& b) noexcept {
+    return a.view().compare(b) <=> 0;
+  }
+  friend std::strong_ordering operator<=>(const String& a, const char* b) noexcept {
+    return a.view().compare(b ? b : "") <=> 0;
   }
   friend std::string operator+(const String& a, std::string_view b) {
     std::string s(a.view());
