@@ -302,7 +302,7 @@ URLSessionCore::~URLSessionCore() {
 
 CURL* URLSessionCore::takeEasy() {
   {
-    std::lock_guard lock(mutex);
+    std::lock_guard lock(spareMutex);
     if (!spareEasy.empty()) {
       CURL* easy = spareEasy.back();
       spareEasy.pop_back();
@@ -316,7 +316,7 @@ void URLSessionCore::recycleEasy(CURL* easy) {
   if (!easy) return;
   curl_easy_reset(easy);  // every option back to its default; caches stay with the multi handle
   {
-    std::lock_guard lock(mutex);
+    std::lock_guard lock(spareMutex);
     const auto kept = static_cast<std::size_t>(
         std::max<std::int64_t>(1, configuration.HTTPMaximumConnectionsPerHost) * 2);
     if (spareEasy.size() < kept) {
@@ -437,10 +437,15 @@ bool URLSessionCore::configure(Transfer& t) {
 
 template <class Work>
 void URLSessionCore::withLock(Work&& work) {
+  std::unique_lock lock(mutex);
+  work();
+  unlockAndFinish(lock);
+}
+
+void URLSessionCore::unlockAndFinish(std::unique_lock<std::mutex>& lock) {
   std::vector<Ended> done;
-  {
-    std::lock_guard lock(mutex);
-    work();
+  for (;;) {
+    addWaitingLocked();
     // Taking a transfer out may let a queued one start.
     if (timeoutNow && multi) driveLocked(CURL_SOCKET_TIMEOUT, 0);
     if (active.empty() && multi) {
@@ -452,8 +457,46 @@ void URLSessionCore::withLock(Work&& work) {
     }
     rearmLocked();
     done.swap(ended);
+    lock.unlock();
+    for (Ended& e : done) finish(std::move(e));
+    done.clear();
+    // A transfer that came while the lock was held, after the last look,
+    // is ours to add: its thread found the lock taken and left it to us.
+    {
+      std::lock_guard waitingLock(waitingMutex);
+      if (waiting.empty()) return;
+    }
+    if (!lock.try_lock()) return;  // the holder adds it
   }
-  for (Ended& e : done) finish(std::move(e));
+}
+
+void URLSessionCore::addWaitingLocked() {
+  std::vector<std::unique_ptr<Transfer>> arrived;
+  {
+    std::lock_guard waitingLock(waitingMutex);
+    arrived.swap(waiting);
+  }
+  if (arrived.empty()) return;
+  bool added = false;
+  for (auto& transfer : arrived) {
+    // A cancel() that came first has found nothing to take out.
+    if (invalidated || transfer->task->state() == URLSessionTask::State::canceling) {
+      ended.push_back({std::move(transfer), CURLE_OK, URLErrorCancelled});
+      continue;
+    }
+    if (!multi && !makeMultiLocked()) {
+      ended.push_back({std::move(transfer), CURLE_OK, URLErrorUnknown});
+      continue;
+    }
+    Transfer& t = *transfer;
+    t.lastActivity = Clock::now();
+    idleCheck = std::min(idleCheck, t.lastActivity + t.idleTimeout);
+    connectionsExpire = Clock::time_point::max();
+    curl_multi_add_handle(multi, t.easy);
+    active.emplace(t.task->taskIdentifier(), std::move(transfer));
+    added = true;
+  }
+  if (added) driveLocked(CURL_SOCKET_TIMEOUT, 0);  // sends the requests if it can
 }
 
 void URLSessionCore::driveLocked(curl_socket_t socket, int events) {
@@ -536,33 +579,17 @@ void URLSessionCore::rearmLocked() {
 
 void URLSessionCore::submit(std::unique_ptr<Transfer> transfer) {
   if (!configure(*transfer)) {
-    const URLPtr url = transfer->request.URL();
-    complete(std::move(transfer), std::nullopt, nullptr,
-             makeURLError(URLErrorUnknown, "The request could not be prepared.", url));
+    finish({std::move(transfer), CURLE_OK, URLErrorUnknown});
     return;
   }
-  bool refused = false;
-  withLock([&] {
-    // A cancel() that came first has found nothing to take out.
-    if (invalidated || transfer->task->state() == URLSessionTask::State::canceling) return;
-    if (!multi && !makeMultiLocked()) {
-      refused = true;
-      return;
-    }
-    Transfer& t = *transfer;
-    t.lastActivity = Clock::now();
-    idleCheck = std::min(idleCheck, t.lastActivity + t.idleTimeout);
-    connectionsExpire = Clock::time_point::max();
-    curl_multi_add_handle(multi, t.easy);
-    active.emplace(t.task->taskIdentifier(), std::move(transfer));
-    driveLocked(CURL_SOCKET_TIMEOUT, 0);  // sends the request if it can
-  });
-  if (transfer) {
-    const URLPtr url = transfer->request.URL();
-    complete(std::move(transfer), std::nullopt, nullptr,
-             refused ? makeURLError(URLErrorUnknown, "The request could not be prepared.", url)
-                     : cancelledError(url));
+  {
+    std::lock_guard waitingLock(waitingMutex);
+    waiting.push_back(std::move(transfer));
   }
+  // Whoever holds the lock adds the transfer before letting go of it, so a
+  // thread that finds it taken goes on with its own work instead of waiting.
+  std::unique_lock lock(mutex, std::try_to_lock);
+  if (lock.owns_lock()) unlockAndFinish(lock);
 }
 
 void URLSessionCore::requestCancel(std::uint64_t taskIdentifier) {
@@ -608,6 +635,11 @@ void URLSessionCore::finish(Ended e) {
   const URLPtr url = t->request.URL();
   if (e.code == URLErrorCancelled) {
     complete(std::move(t), std::nullopt, nullptr, cancelledError(url));
+    return;
+  }
+  if (e.code == URLErrorUnknown) {
+    complete(std::move(t), std::nullopt, nullptr,
+             makeURLError(URLErrorUnknown, "The request could not be prepared.", url));
     return;
   }
   if (e.code == URLErrorTimedOut) {

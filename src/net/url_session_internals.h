@@ -96,10 +96,11 @@ struct URLSessionTask::Impl {
 };
 
 // The multi handle is driven by whichever thread has something to do: resume()
-// adds the transfer and sends the request on the calling thread, cancel()
-// takes it out on its thread, and the library's event thread runs it when a
-// socket is ready or a deadline passes. No thread has to wake another to get a
-// request sent.
+// adds the transfer and sends the request on the calling thread (or, when
+// another thread holds the lock, leaves it to that thread), cancel() takes it
+// out on its thread, and the library's event thread runs it when a socket is
+// ready or a deadline passes. No thread has to wake another to get a request
+// sent, and no thread waits for the lock to hand one over.
 struct URLSessionCore : std::enable_shared_from_this<URLSessionCore> {
   URLSessionCore(URLSessionConfiguration configuration, std::shared_ptr<OperationQueue> queue);
   ~URLSessionCore();
@@ -112,8 +113,8 @@ struct URLSessionCore : std::enable_shared_from_this<URLSessionCore> {
   const std::string trustedFile = environment("SSL_CERT_FILE");
   const std::string trustedDirectory = environment("SSL_CERT_DIR");
 
-  // Guards everything below. Every call into `multi` is made holding it, so
-  // libcurl's callbacks run under it too.
+  // Guards everything below up to the waiting transfers. Every call into `multi` is made holding
+  // it, so libcurl's callbacks run under it too.
   std::mutex mutex;
   // Made with the first transfer; dropped, with the connections it keeps,
   // once the session has been unused for a while or is invalidated.
@@ -125,9 +126,14 @@ struct URLSessionCore : std::enable_shared_from_this<URLSessionCore> {
   Clock::time_point curlDeadline = Clock::time_point::max();
   Clock::time_point idleCheck = Clock::time_point::max();  // no transfer goes idle before
   Clock::time_point connectionsExpire = Clock::time_point::max();
+  // Transfers resumed while another thread held the lock; the holder adds
+  // them to the multi handle before it lets go.
+  std::mutex waitingMutex;
+  std::vector<std::unique_ptr<Transfer>> waiting;  // guarded by waitingMutex
   // Easy handles of ended transfers, reset and kept for the next ones: making
   // one is a large zeroed allocation and a dozen more.
-  std::vector<CURL*> spareEasy;
+  std::mutex spareMutex;
+  std::vector<CURL*> spareEasy;                 // guarded by spareMutex
   std::unique_ptr<DispatchTimer> curlTimer;     // fires at curlDeadline
   std::unique_ptr<DispatchTimer> sessionTimer;  // fires at idleCheck or connectionsExpire
   Clock::time_point curlArmed = Clock::time_point::max();
@@ -147,6 +153,10 @@ struct URLSessionCore : std::enable_shared_from_this<URLSessionCore> {
   // Runs `work` under the lock, then completes what it ended.
   template <class Work>
   void withLock(Work&& work);
+  // Adds the waiting transfers, completes what ended, and lets go of the
+  // lock; takes it again while transfers keep arriving meanwhile.
+  void unlockAndFinish(std::unique_lock<std::mutex>& lock);
+  void addWaitingLocked();
   bool makeMultiLocked();
   void releaseMultiLocked();
   void driveLocked(curl_socket_t socket, int events);
