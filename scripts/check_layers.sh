@@ -3,6 +3,7 @@
 # layers below it. Prints each offending include and exits 1 if there is one.
 #
 #   base <- dispatch, text <- net <- the SDK areas, tools, tests, bench, fuzz
+#   base <- system, security <- the SDK areas
 set -euo pipefail
 cd "$(dirname "${BASH_SOURCE[0]}")/.."
 
@@ -12,6 +13,8 @@ declare -A allowed=(
   [dispatch]="base"
   [text]="base"
   [net]="base dispatch text"
+  [system]="base"
+  [security]="base"
 )
 
 status=0

@@ -26,7 +26,11 @@ done
 #   nginx, openssl: a real HTTPS and HTTP/2 server for the network tests,
 #   started by the tests themselves on 127.0.0.1 (never as a service).
 #   libglib2.0-dev: the GLib main loop that the host-loop test drives the main
-#   run loop from, as a GTK application would.
+#   run loop from, as a GTK application would; GDBus for the fingerprint
+#   service.
+#   libsecret-1-dev: the user's Secret Service keyring.
+#   gnome-keyring, dbus-daemon, python3-dbusmock: a real keyring and a
+#   scripted fingerprint service on a private bus, started by the tests.
 PACKAGES=(
   cmake
   ninja-build
@@ -47,6 +51,10 @@ PACKAGES=(
   nginx
   openssl
   libglib2.0-dev
+  libsecret-1-dev
+  gnome-keyring
+  dbus-daemon
+  python3-dbusmock
 )
 # The peer benchmark's other clients and JSON readers (Qt 6 Core and Network,
 # POCO Net and NetSSL, RapidJSON); never needed by the library or its tests.
