@@ -36,7 +36,7 @@ bash scripts/deps.sh
 # Later settings win, so anything already in the environment overrides these.
 export ASAN_OPTIONS="halt_on_error=1:print_stacktrace=1:detect_leaks=1${ASAN_OPTIONS:+:$ASAN_OPTIONS}"
 export UBSAN_OPTIONS="halt_on_error=1:print_stacktrace=1${UBSAN_OPTIONS:+:$UBSAN_OPTIONS}"
-export TSAN_OPTIONS="halt_on_error=1:second_deadlock_stack=1${TSAN_OPTIONS:+:$TSAN_OPTIONS}"
+export TSAN_OPTIONS="halt_on_error=1:second_deadlock_stack=1:suppressions=$root/tests/tsan.supp${TSAN_OPTIONS:+:$TSAN_OPTIONS}"
 
 total_passed=0
 total_skipped=0

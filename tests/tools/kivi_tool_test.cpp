@@ -259,6 +259,7 @@ TEST(KiviToolTest, DemoFinishesAndShowsTransitionsAndEveryRestStatus) {
 #include <thread>
 
 #include "kivi/dispatch/distributed_lock.h"
+#include "kivi/text/json_serialization.h"
 
 namespace kivi {
 namespace {
@@ -358,6 +359,65 @@ TEST(KiviToolTest, LockIsReleasedWhenTheToolIsTerminatedWhileTheCommandRuns) {
   }
   EXPECT_TRUE(WIFEXITED(status) && WEXITSTATUS(status) == 128 + SIGTERM) << status;
   EXPECT_FALSE(std::filesystem::exists(lock));
+}
+
+}  // namespace
+}  // namespace kivi
+
+namespace kivi {
+namespace {
+
+// Every fact, aligned for people and as one object for scripts; with no
+// keyring or fingerprint service to reach, their answers are the in-band ones.
+TEST(KiviToolTest, DeviceListsEveryFact) {
+  ::setenv("DBUS_SESSION_BUS_ADDRESS", "unix:path=/nonexistent/kivi-bus", 1);
+  ::setenv("DBUS_SYSTEM_BUS_ADDRESS", "unix:path=/nonexistent/kivi-bus", 1);
+  const ToolRun text = kivi({"device"});
+  ASSERT_EQ(text.exit, 0) << text.err;
+  const std::vector<std::string> names = {"machine",
+                                          "platformName",
+                                          "hardwareModel",
+                                          "isDeviceiPadPro",
+                                          "isDeviceiPhoneX",
+                                          "processResidentSize",
+                                          "processPhysicalFootprint",
+                                          "physicalMemory",
+                                          "processFreeMemory",
+                                          "totalMemory",
+                                          "userMemory",
+                                          "applicationMemory",
+                                          "freeMemory",
+                                          "percentCpuUsage",
+                                          "touchID",
+                                          "faceID",
+                                          "serialNumber",
+                                          "applicationIdentifierPrefix",
+                                          "region",
+                                          "timeZone",
+                                          "locatedInEU"};
+  std::istringstream lines(text.out);
+  std::string line;
+  std::size_t column = std::string::npos;
+  for (const auto& name : names) {
+    ASSERT_TRUE(std::getline(lines, line)) << name;
+    EXPECT_TRUE(line.starts_with(name + ":") || line.starts_with(name + " (")) << line;
+    const std::size_t value = line.find_first_not_of(' ', line.find(':') + 1);
+    if (column == std::string::npos) column = value;
+    EXPECT_EQ(value, column) << line;  // aligned
+  }
+  EXPECT_NE(text.out.find(" none (NSOSStatusErrorDomain -25291)\n"), std::string::npos) << text.out;
+
+  const ToolRun json = kivi({"device", "--json"});
+  ASSERT_EQ(json.exit, 0) << json.err;
+  ErrorPtr error;
+  const auto object = JSONSerialization::JSONObjectWithData(json.out, 0, &error);
+  ASSERT_TRUE(object && object->asDictionary()) << json.out;
+  for (const auto& name : names) EXPECT_TRUE(object->asDictionary()->contains(name)) << name;
+  EXPECT_TRUE(object->asDictionary()->at("processResidentSize").asNumber());
+
+  EXPECT_EQ(kivi({"device", "--yaml"}).exit, 2);
+  ::unsetenv("DBUS_SESSION_BUS_ADDRESS");
+  ::unsetenv("DBUS_SYSTEM_BUS_ADDRESS");
 }
 
 }  // namespace

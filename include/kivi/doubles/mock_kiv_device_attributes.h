@@ -1,0 +1,34 @@
+// MockKivDeviceAttributes: a scriptable KivDeviceAttributesProtocol.
+//
+// getMacHardwareSerialNumber() answers what getMacHardwareSerialNumberBlock
+// answers; without the block it answers absent. Nothing reaches the machine.
+//
+//   auto device = std::make_shared<kivi::MockKivDeviceAttributes>();
+//   device->getMacHardwareSerialNumberBlock = [] { return std::optional<std::string>("C02XYZ"); };
+//   enrolment.setDevice(device);
+//
+// Thread contract: none; the block runs synchronously on the calling thread.
+// Set it before handing the double out.
+#pragma once
+
+#include <functional>
+#include <optional>
+#include <string>
+
+#include "kivi/base/object.h"
+#include "kivi/device/kiv_device_attributes_protocol.h"
+
+namespace kivi {
+
+class MockKivDeviceAttributes : public Object, public KivDeviceAttributesProtocol {
+ public:
+  MockKivDeviceAttributes() = default;
+
+  std::function<std::optional<std::string>()> getMacHardwareSerialNumberBlock;
+
+  std::optional<std::string> getMacHardwareSerialNumber() override;
+
+  std::string description() const override { return Object::description(); }
+};
+
+}  // namespace kivi
