@@ -7,62 +7,9 @@
 #include <cstdlib>
 
 #include "kivi/dispatch/detail/event_loop.h"
-#include "kivi/text/unicode_text.h"
 #include "url_session_internals.h"
 
 namespace kivi {
-
-namespace url_session_detail {
-
-// Header values are bytes; keep valid UTF-8 as it is and read anything else as
-// ISO-8859-1, so every string handed out is valid UTF-8.
-std::string headerText(std::string_view bytes) {
-  if (unicode::isValidUTF8(bytes)) return std::string(bytes);
-  std::string out;
-  out.reserve(bytes.size() * 2);
-  for (unsigned char c : bytes) {
-    if (c < 0x80) {
-      out += static_cast<char>(c);
-    } else {
-      out += static_cast<char>(0xC0 | (c >> 6));
-      out += static_cast<char>(0x80 | (c & 0x3F));
-    }
-  }
-  return out;
-}
-
-bool isToken(std::string_view name) {
-  if (name.empty()) return false;
-  for (unsigned char c : name) {
-    const bool ok =
-        (c >= '0' && c <= '9') || (c >= 'a' && c <= 'z') || (c >= 'A' && c <= 'Z') ||
-        std::string_view("!#$%&'*+-.^_`|~").find(static_cast<char>(c)) != std::string_view::npos;
-    if (!ok) return false;
-  }
-  return true;
-}
-
-bool hasLineBreakOrNul(std::string_view text) {
-  return text.find_first_of(std::string_view("\r\n\0", 3)) != std::string_view::npos;
-}
-
-ErrorPtr makeURLError(std::int64_t code, const std::string& description, const URLPtr& url,
-                      const std::string& detail) {
-  Dictionary info;
-  info.emplace(LocalizedDescriptionKey, Value(description));
-  if (url) {
-    info.emplace(URLErrorFailingURLErrorKey, Value(url));
-    info.emplace(URLErrorFailingURLStringErrorKey, Value(url->absoluteString()));
-  }
-  if (!detail.empty()) info.emplace(DebugDescriptionErrorKey, Value(detail));
-  return Error::create(URLErrorDomain, code, std::move(info));
-}
-
-ErrorPtr cancelledError(const URLPtr& url) {
-  return makeURLError(URLErrorCancelled, "cancelled", url);
-}
-
-}  // namespace url_session_detail
 
 namespace {
 
