@@ -116,13 +116,11 @@ std::optional<std::uint64_t> kilobytesField(std::string_view text, std::string_v
 }
 
 kern_return_t vmTaskInfo(task_vm_info_data_t& out) {
-  std::string status, rollup;
-  if (!system::readFileUnderRoot("/proc/self/status", status) ||
-      !system::readFileUnderRoot("/proc/self/smaps_rollup", rollup))
-    return KERN_FAILURE;
+  std::string status;
+  if (!system::readFileUnderRoot("/proc/self/status", status)) return KERN_FAILURE;
   const auto size = kilobytesField(status, "VmSize"), rss = kilobytesField(status, "VmRSS"),
-             peak = kilobytesField(status, "VmHWM"),
-             dirty = kilobytesField(rollup, "Private_Dirty"), swap = kilobytesField(rollup, "Swap");
+             peak = kilobytesField(status, "VmHWM"), dirty = kilobytesField(status, "RssAnon"),
+             swap = kilobytesField(status, "VmSwap");
   if (!size || !rss || !peak || !dirty || !swap) return KERN_FAILURE;
   std::memset(&out, 0, sizeof out);
   out.virtual_size = *size;
@@ -202,13 +200,17 @@ std::mutex gSamplesMutex;
 std::map<std::pair<std::string, thread_act_t>, Sample> gSamples;  // by (root, tid)
 constexpr std::size_t kMostSamples = 4096;
 
-integer_t usageFromRunTime(thread_act_t thread, const std::string& dir, const StatLine& stat,
-                           std::optional<std::uint64_t> staleUtilisation) {
+integer_t usageFromUtilisation(std::uint64_t utilisation) {
+  return static_cast<integer_t>(
+      std::min<std::uint64_t>(utilisation * TH_USAGE_SCALE / 1024, TH_USAGE_SCALE));
+}
+
+integer_t usageFromRunTime(thread_act_t thread, const std::string& dir, const StatLine& stat) {
   const auto run = runTime(dir, stat);
   if (!run) {
-    return staleUtilisation ? static_cast<integer_t>(std::min<std::uint64_t>(
-                                  *staleUtilisation * TH_USAGE_SCALE / 1024, TH_USAGE_SCALE))
-                            : 0;
+    // No run time at all: the kernel's last utilisation, however stale.
+    const auto stale = utilisation(dir);
+    return stale ? usageFromUtilisation(*stale) : 0;
   }
   const auto now = std::chrono::steady_clock::now();
   std::optional<Sample> previous;
@@ -263,14 +265,11 @@ kern_return_t basicThreadInfo(thread_act_t thread, thread_basic_info_data_t& out
   out.policy = policyFromLinux(*policy);
   out.run_state = runStateFromLinux(stat.fields[kState][0]);
   out.flags = *policy == kSchedIdle ? TH_FLAGS_IDLE : 0;
-  // The kernel's utilisation is current only while the thread runs.
-  const auto util = utilisation(dir);
-  if (util && out.run_state == TH_STATE_RUNNING) {
-    out.cpu_usage = static_cast<integer_t>(
-        std::min<std::uint64_t>(*util * TH_USAGE_SCALE / 1024, TH_USAGE_SCALE));
-  } else {
-    out.cpu_usage = usageFromRunTime(thread, dir, stat, util);
-  }
+  // The kernel's utilisation is current only while the thread runs (and
+  // the sched file costs several times the stat line, so a sleeping thread
+  // does without it).
+  const auto util = out.run_state == TH_STATE_RUNNING ? utilisation(dir) : std::nullopt;
+  out.cpu_usage = util ? usageFromUtilisation(*util) : usageFromRunTime(thread, dir, stat);
   return KERN_SUCCESS;
 }
 
