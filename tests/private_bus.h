@@ -9,7 +9,6 @@
 #pragma once
 
 #include <signal.h>
-#include <spawn.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
@@ -20,7 +19,7 @@
 #include <thread>
 #include <vector>
 
-extern char** environ;
+#include "child_process.h"
 
 namespace kivi::testing {
 
@@ -69,25 +68,16 @@ class PrivateBus {
   const std::string& directory() const { return dir_; }
 
   // Starts a process with the bus as both its session and its system bus,
-  // plus `environment` ("NAME=value"); stopped (SIGTERM, then SIGKILL) with
-  // the bus. Answers its pid, or -1.
+  // plus `environment` ("NAME=value", replacing inherited variables); stopped
+  // (SIGTERM, then SIGKILL) with the bus. Answers its pid, or -1.
   pid_t spawn(const std::vector<std::string>& arguments,
-              const std::vector<std::string>& environment = {}) {
-    std::vector<std::string> env;
-    for (char** e = environ; *e; ++e) env.emplace_back(*e);
+              std::vector<std::string> environment = {}) {
     if (!address_.empty()) {
-      env.push_back("DBUS_SESSION_BUS_ADDRESS=" + address_);
-      env.push_back("DBUS_SYSTEM_BUS_ADDRESS=" + address_);
+      environment.push_back("DBUS_SESSION_BUS_ADDRESS=" + address_);
+      environment.push_back("DBUS_SYSTEM_BUS_ADDRESS=" + address_);
     }
-    env.insert(env.end(), environment.begin(), environment.end());
-    std::vector<char*> argv, envp;
-    for (const auto& a : arguments) argv.push_back(const_cast<char*>(a.c_str()));
-    argv.push_back(nullptr);
-    for (const auto& e : env) envp.push_back(const_cast<char*>(e.c_str()));
-    envp.push_back(nullptr);
-    pid_t pid = -1;
-    if (::posix_spawn(&pid, argv[0], nullptr, nullptr, argv.data(), envp.data()) != 0) return -1;
-    children_.push_back(pid);
+    const pid_t pid = spawnChild(arguments, environment);
+    if (pid > 0) children_.push_back(pid);
     return pid;
   }
 

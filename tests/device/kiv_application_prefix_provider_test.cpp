@@ -19,109 +19,25 @@
 #include <thread>
 #include <vector>
 
+#include "keyring_session.h"
 #include "kivi/security/keychain.h"
-#include "private_bus.h"
 #include "test_support.h"
 
 namespace kivi {
 namespace {
 
-constexpr const char* kKeyringDaemon = "/usr/bin/gnome-keyring-daemon";
 constexpr const char* kChildMode = "KIVI_PREFIX_CHILD";
 constexpr const char* kChildBarrier = "KIVI_PREFIX_BARRIER";  // a directory
 
-// Starts `arguments` with `environment` replacing inherited variables of the
-// same names, stdout to `outputFile`. Answers its pid, or -1.
-pid_t spawnChild(const std::vector<std::string>& arguments,
-                 const std::vector<std::string>& environment, const std::string& outputFile) {
-  std::vector<std::string> env = environment;
-  for (char** e = environ; *e; ++e) {
-    const std::string inherited = *e;
-    const std::string name = inherited.substr(0, inherited.find('=') + 1);
-    if (std::none_of(environment.begin(), environment.end(),
-                     [&](const std::string& given) { return given.starts_with(name); })) {
-      env.push_back(inherited);
-    }
-  }
-  std::vector<char*> argv, envp;
-  for (const auto& a : arguments) argv.push_back(const_cast<char*>(a.c_str()));
-  argv.push_back(nullptr);
-  for (const auto& e : env) envp.push_back(const_cast<char*>(e.c_str()));
-  envp.push_back(nullptr);
-  posix_spawn_file_actions_t actions;
-  posix_spawn_file_actions_init(&actions);
-  posix_spawn_file_actions_addopen(&actions, 1, outputFile.c_str(), O_WRONLY | O_CREAT | O_TRUNC,
-                                   0600);
-  pid_t pid = -1;
-  const int spawned = ::posix_spawn(&pid, argv[0], &actions, nullptr, argv.data(), envp.data());
-  posix_spawn_file_actions_destroy(&actions);
-  return spawned == 0 ? pid : -1;
-}
+using testing::printed;
+using testing::sharedKeyring;
 
-// Waits for the child with a deadline (then kills it); answers its stdout
-// followed by "EXIT=<exit code, -1 when killed>".
+// Waits for the child; answers its stdout followed by "EXIT=<exit code, -1
+// when killed>".
 std::string waitChild(pid_t pid, const std::string& outputFile) {
   if (pid <= 0) return "<not started>";
-  const auto deadline = std::chrono::steady_clock::now() + std::chrono::seconds(30);
-  int status = 0;
-  while (::waitpid(pid, &status, WNOHANG) == 0) {
-    if (std::chrono::steady_clock::now() > deadline) ::kill(pid, SIGKILL);
-    std::this_thread::sleep_for(std::chrono::milliseconds(5));
-  }
-  std::ifstream in(outputFile);
-  return std::string(std::istreambuf_iterator<char>(in), {}) +
-         "\nEXIT=" + std::to_string(WIFEXITED(status) ? WEXITSTATUS(status) : -1) + "\n";
-}
-
-// The value printed by a child as "NAME=value" on a line of its own.
-std::string printed(const std::string& output, const std::string& name) {
-  std::smatch m;
-  if (std::regex_search(output, m, std::regex("(^|\n)" + name + "=([^\n]*)"))) return m[2];
-  return "<not printed>";
-}
-
-// A gnome-keyring-daemon with an unlocked login keyring on a private bus;
-// this process is pointed at it on first use.
-struct Keyring {
-  testing::PrivateBus bus;
-  std::string failure;  // why it did not start
-
-  Keyring() {
-    if (!bus.started()) {
-      failure = "the private bus did not start";
-      return;
-    }
-    const std::string home = bus.directory() + "/home";
-    const std::string runtime = bus.directory() + "/runtime";
-    std::filesystem::create_directories(home + "/data");
-    ::mkdir(runtime.c_str(), 0700);
-    // The password on stdin; env(1) rather than spawn's environment, which
-    // would come after (and lose to) this process's own variables.
-    std::ofstream(bus.directory() + "/password") << "test";
-    bus.spawn({"/bin/sh", "-c",
-               "exec /usr/bin/env HOME=" + home + " XDG_DATA_HOME=" + home +
-                   "/data XDG_RUNTIME_DIR=" + runtime +
-                   " DBUS_SESSION_BUS_ADDRESS=" + bus.address() + " " + kKeyringDaemon +
-                   " --foreground --components=secrets --unlock <" + bus.directory() +
-                   "/password >/dev/null"});
-    const std::string out = bus.directory() + "/wait.out";
-    const std::string waited =
-        waitChild(spawnChild({"/usr/bin/gdbus", "wait", "--address", bus.address(), "--timeout",
-                              "10", "org.freedesktop.secrets"},
-                             {}, out),
-                  out);
-    if (printed(waited, "EXIT") != "0") {
-      failure = "the keyring daemon did not appear on the bus";
-      return;
-    }
-    ::setenv("DBUS_SESSION_BUS_ADDRESS", bus.address().c_str(), 1);
-    ::setenv("XDG_RUNTIME_DIR", runtime.c_str(), 1);
-  }
-};
-
-Keyring& sharedKeyring() {
-  static Keyring keyring;
-  return keyring;
+  const testing::ChildResult r = testing::waitForChild(pid, outputFile);
+  return r.output + "\nEXIT=" + std::to_string(r.exitCode) + "\n";
 }
 
 const Dictionary kMarker{{kSecClass, kSecClassGenericPassword},
@@ -131,8 +47,9 @@ const Dictionary kMarker{{kSecClass, kSecClassGenericPassword},
 class KivApplicationPrefixProviderTest : public ::testing::Test {
  protected:
   void SetUp() override {
-    if (!testing::PrivateBus::available()) GTEST_SKIP() << "dbus-daemon is not installed";
-    if (::access(kKeyringDaemon, X_OK) != 0) GTEST_SKIP() << "gnome-keyring-daemon is missing";
+    if (const std::string reason = testing::keyringSkipReason(); !reason.empty()) {
+      GTEST_SKIP() << reason;
+    }
     ASSERT_EQ(sharedKeyring().failure, "");
     const OSStatus cleared = SecItemDelete(kMarker);
     ASSERT_TRUE(cleared == errSecSuccess || cleared == errSecItemNotFound) << cleared;
@@ -146,7 +63,8 @@ class KivApplicationPrefixProviderTest : public ::testing::Test {
                           const std::string& binary = "/proc/self/exe",
                           const std::string& output = outputFile()) {
     environment.push_back(std::string(kChildMode) + "=1");
-    return spawnChild({binary, "--gtest_filter=PrefixProviderChild.Run"}, environment, output);
+    return testing::spawnChild({binary, "--gtest_filter=PrefixProviderChild.Run"}, environment,
+                               output);
   }
   static std::string runChild(std::vector<std::string> environment,
                               const std::string& binary = "/proc/self/exe") {

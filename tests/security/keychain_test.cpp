@@ -20,127 +20,25 @@
 #include <thread>
 #include <vector>
 
-#include "private_bus.h"
+#include "keyring_session.h"
 #include "test_support.h"
 
 namespace kivi {
 namespace {
 
-constexpr const char* kKeyringDaemon = "/usr/bin/gnome-keyring-daemon";
 constexpr const char* kChildMode = "KIVI_KEYCHAIN_CHILD";
 
-struct ChildResult {
-  int exitCode = -1;
-  std::string output;
-};
-
-// Runs `arguments` with `environment` added, stdout to a file; waits with a
-// deadline (then kills it).
-ChildResult runChild(const std::vector<std::string>& arguments,
-                     const std::vector<std::string>& environment, const std::string& outputFile) {
-  std::vector<std::string> env = environment;  // these replace inherited ones
-  for (char** e = environ; *e; ++e) {
-    const std::string inherited = *e;
-    const std::string name = inherited.substr(0, inherited.find('=') + 1);
-    if (std::none_of(environment.begin(), environment.end(),
-                     [&](const std::string& given) { return given.starts_with(name); })) {
-      env.push_back(inherited);
-    }
-  }
-  std::vector<char*> argv, envp;
-  for (const auto& a : arguments) argv.push_back(const_cast<char*>(a.c_str()));
-  argv.push_back(nullptr);
-  for (const auto& e : env) envp.push_back(const_cast<char*>(e.c_str()));
-  envp.push_back(nullptr);
-  posix_spawn_file_actions_t actions;
-  posix_spawn_file_actions_init(&actions);
-  posix_spawn_file_actions_addopen(&actions, 1, outputFile.c_str(), O_WRONLY | O_CREAT | O_TRUNC,
-                                   0600);
-  ChildResult result;
-  pid_t pid = -1;
-  const int spawned = ::posix_spawn(&pid, argv[0], &actions, nullptr, argv.data(), envp.data());
-  posix_spawn_file_actions_destroy(&actions);
-  if (spawned != 0) return result;
-  int status = 0;
-  const auto deadline = std::chrono::steady_clock::now() + std::chrono::seconds(30);
-  while (::waitpid(pid, &status, WNOHANG) == 0) {
-    if (std::chrono::steady_clock::now() > deadline) ::kill(pid, SIGKILL);
-    std::this_thread::sleep_for(std::chrono::milliseconds(5));
-  }
-  result.exitCode = WIFEXITED(status) ? WEXITSTATUS(status) : -1;
-  std::ifstream in(outputFile);
-  result.output.assign(std::istreambuf_iterator<char>(in), {});
-  return result;
-}
-
-// The value printed by a child as "NAME=value" on a line of its own.
-std::string printed(const std::string& output, const std::string& name) {
-  std::smatch m;
-  if (std::regex_search(output, m, std::regex("(^|\n)" + name + "=([^\n]*)"))) return m[2];
-  return "<not printed>";
-}
-
-// A gnome-keyring-daemon with an unlocked login keyring on a bus of its own.
-struct Keyring {
-  testing::PrivateBus bus;
-  std::string runtime;
-  std::string failure;  // why it did not start
-
-  Keyring() {
-    if (!bus.started()) {
-      failure = "the private bus did not start";
-      return;
-    }
-    const std::string home = bus.directory() + "/home";
-    runtime = bus.directory() + "/runtime";
-    std::filesystem::create_directories(home + "/data");
-    ::mkdir(runtime.c_str(), 0700);
-    // The password on stdin; env(1) rather than spawn's environment, which
-    // would come after (and lose to) this process's own variables.
-    std::ofstream(bus.directory() + "/password") << "test";
-    bus.spawn({"/bin/sh", "-c",
-               "exec /usr/bin/env HOME=" + home + " XDG_DATA_HOME=" + home +
-                   "/data XDG_RUNTIME_DIR=" + runtime +
-                   " DBUS_SESSION_BUS_ADDRESS=" + bus.address() + " " + kKeyringDaemon +
-                   " --foreground --components=secrets --unlock <" + bus.directory() +
-                   "/password >/dev/null"});
-    const ChildResult waited = runChild({"/usr/bin/gdbus", "wait", "--address", bus.address(),
-                                         "--timeout", "10", "org.freedesktop.secrets"},
-                                        {}, bus.directory() + "/wait.out");
-    if (waited.exitCode != 0) failure = "the keyring daemon did not appear on the bus";
-  }
-
-  // The environment that points a child at this keyring.
-  std::vector<std::string> environment() const {
-    return {"DBUS_SESSION_BUS_ADDRESS=" + bus.address(), "XDG_RUNTIME_DIR=" + runtime};
-  }
-};
-
-std::string skipReason() {
-  if (!testing::PrivateBus::available()) return "dbus-daemon is not installed";
-  if (::access(kKeyringDaemon, X_OK) != 0) return "gnome-keyring-daemon is not installed";
-  if (::access("/usr/bin/gdbus", X_OK) != 0) return "gdbus is not installed";
-  return "";
-}
-
-// The binary's keyring, started on first use; this process talks to it.
-Keyring& sharedKeyring() {
-  static Keyring keyring;
-  static const bool pointed = [] {
-    for (const std::string& e : keyring.environment()) {
-      const auto eq = e.find('=');
-      ::setenv(e.substr(0, eq).c_str(), e.substr(eq + 1).c_str(), 1);
-    }
-    return true;
-  }();
-  (void)pointed;
-  return keyring;
-}
+using testing::ChildResult;
+using testing::Keyring;
+using testing::printed;
+using testing::runChild;
+using testing::sharedKeyring;
 
 class KeychainTest : public ::testing::Test {
  protected:
   void SetUp() override {
-    if (const std::string reason = skipReason(); !reason.empty()) GTEST_SKIP() << reason;
+    if (const std::string reason = testing::keyringSkipReason(); !reason.empty())
+      GTEST_SKIP() << reason;
     ASSERT_EQ(sharedKeyring().failure, "");
   }
 
@@ -226,12 +124,8 @@ TEST_F(KeychainTest, AddedItemsAreFoundWithTheirAttributesAndData) {
             errSecItemNotFound);
 
   // The items are the keyring's own, under the keychain's schema.
-  const ChildResult search =
-      runChild({"/usr/bin/gdbus", "call", "--address", sharedKeyring().bus.address(), "--dest",
-                "org.freedesktop.secrets", "--object-path", "/org/freedesktop/secrets", "--method",
-                "org.freedesktop.Secret.Service.SearchItems",
-                "{'xdg:schema': 'org.kiviossdk.Keychain', 'svce': 'found'}"},
-               {}, sharedKeyring().bus.directory() + "/search.out");
+  const ChildResult search = sharedKeyring().call(
+      "SearchItems", "{'xdg:schema': 'org.kiviossdk.Keychain', 'svce': 'found'}");
   EXPECT_TRUE(std::regex_match(
       search.output,
       std::regex(
@@ -330,11 +224,7 @@ TEST_F(KeychainTest, ALockedKeyringIsNotAvailableAndNeverPrompts) {
   ASSERT_EQ(other.failure, "");
   ASSERT_EQ(printed(child("add", other.environment()).output, "ADD"), "0");
   const ChildResult lock =
-      runChild({"/usr/bin/gdbus", "call", "--address", other.bus.address(), "--dest",
-                "org.freedesktop.secrets", "--object-path", "/org/freedesktop/secrets", "--method",
-                "org.freedesktop.Secret.Service.Lock",
-                "[objectpath '/org/freedesktop/secrets/collection/login']"},
-               {}, other.bus.directory() + "/lock.out");
+      other.call("Lock", "[objectpath '/org/freedesktop/secrets/collection/login']");
   ASSERT_EQ(lock.exitCode, 0) << lock.output;
 
   const ChildResult r = child("unavailable", other.environment());

@@ -15,22 +15,6 @@ namespace {
 
 constexpr LAPolicy kBiometrics = LAPolicyDeviceOwnerAuthenticationWithBiometrics;
 
-// Runs a program to its end; its exit status, or -1 (killed after kTimeout).
-int run(const std::vector<std::string>& arguments) {
-  std::vector<char*> argv;
-  for (const auto& a : arguments) argv.push_back(const_cast<char*>(a.c_str()));
-  argv.push_back(nullptr);
-  pid_t pid = -1;
-  if (::posix_spawn(&pid, argv[0], nullptr, nullptr, argv.data(), environ) != 0) return -1;
-  int status = 0;
-  const auto deadline = std::chrono::steady_clock::now() + testing::kTimeout;
-  while (::waitpid(pid, &status, WNOHANG) == 0) {
-    if (std::chrono::steady_clock::now() > deadline) ::kill(pid, SIGKILL);
-    std::this_thread::sleep_for(std::chrono::milliseconds(10));
-  }
-  return WIFEXITED(status) ? WEXITSTATUS(status) : -1;
-}
-
 void expectError(const ErrorPtr& error, LAError code, const std::string& description) {
   ASSERT_NE(error, nullptr);
   EXPECT_EQ(error->domain(), LAErrorDomain);
@@ -59,8 +43,9 @@ class LAContextTest : public ::testing::Test {
                           bus_.directory() + "/mock.log", "-p",
                           R"({"user": ")" + user + R"(", "readers": )" + readers + "}"}),
               0);
-    ASSERT_EQ(run({"/usr/bin/gdbus", "wait", "--address", bus_.address(), "--timeout", "10",
-                   "net.reactivated.Fprint"}),
+    ASSERT_EQ(testing::runChild({"/usr/bin/gdbus", "wait", "--address", bus_.address(), "--timeout",
+                                 "10", "net.reactivated.Fprint"})
+                  .exitCode,
               0);
   }
 
