@@ -1,9 +1,11 @@
 #include "kivi/system/io_registry.h"
 
 #include <sys/stat.h>
+#include <unicode/utf8.h>
 
 #include <algorithm>
 #include <cctype>
+#include <cstdint>
 #include <mutex>
 #include <optional>
 #include <set>
@@ -35,13 +37,25 @@ bool firmwareDescribesMachine() {
                      [](const char* path) { return isDirectory(path); });
 }
 
-// A DMI value without the newline sysfs adds; nullopt when unreadable or empty.
+bool isUTF8(std::string_view text) {
+  const auto* bytes = reinterpret_cast<const std::uint8_t*>(text.data());
+  const auto length = static_cast<std::int32_t>(text.size());
+  for (std::int32_t at = 0; at < length;) {
+    UChar32 c = 0;
+    U8_NEXT(bytes, at, length, c);
+    if (c < 0) return false;
+  }
+  return true;
+}
+
+// A DMI value without the newline sysfs adds; nullopt when unreadable, empty
+// or not text.
 std::optional<std::string> dmiValue(std::string_view name) {
   std::string text;
   if (!system::readFileUnderRoot(std::string(kDmi) + "/" + std::string(name), text))
     return std::nullopt;
   if (!text.empty() && text.back() == '\n') text.pop_back();
-  if (text.empty()) return std::nullopt;
+  if (text.empty() || !isUTF8(text)) return std::nullopt;
   return text;
 }
 
@@ -51,7 +65,7 @@ std::optional<std::string> deviceTreeValue(std::string_view name) {
     std::string text;
     if (!system::readFileUnderRoot(std::string(base) + "/" + std::string(name), text)) continue;
     while (!text.empty() && text.back() == '\0') text.pop_back();
-    if (!text.empty()) return text;
+    if (!text.empty() && isUTF8(text)) return text;
   }
   return std::nullopt;
 }

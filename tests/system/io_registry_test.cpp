@@ -51,13 +51,13 @@ TEST_F(IORegistryTest, DmiPropertiesKeepTheFirmwareText) {
   EXPECT_EQ(IOObjectRelease(0), KERN_INVALID_ARGUMENT);
 }
 
-TEST_F(IORegistryTest, PlaceholdersFallBackToTheDeviceTree) {
+TEST_F(IORegistryTest, PlaceholdersAndBinaryFallBackToTheDeviceTree) {
   root.write("/sys/class/dmi/id/product_name", "");
   const io_service_t device = platformDevice();
   ASSERT_NE(device, 0u);
   for (const char* placeholder :
        {"To Be Filled By O.E.M.\n", "Not Specified\n", "System Serial Number\n", "default STRING\n",
-        " 0 \n", "None\n", "   \n", ""}) {
+        " 0 \n", "None\n", "   \n", "", "C02\xff\xfe\n"}) {
     root.write("/sys/class/dmi/id/product_serial", placeholder);
     EXPECT_TRUE(property(device, "IOPlatformSerialNumber").isNull()) << placeholder;
   }

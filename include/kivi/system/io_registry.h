@@ -16,15 +16,16 @@
 // kivi::system::root(). Its properties, each a String read when asked for:
 //   "IOPlatformSerialNumber"  DMI product_serial, else the device tree's
 //       serial-number. A source that cannot be read (DMI's serial is readable
-//       only by root), is empty or holds a placeholder the firmware was
-//       shipped with is skipped. The placeholders, compared without
+//       only by root), is empty, is not UTF-8 text or holds a placeholder the
+//       firmware was shipped with is skipped. The placeholders, compared without
 //       surrounding white space and ignoring case, are
 //         "To Be Filled By O.E.M."  "Not Specified"  "System Serial Number"
 //         "Default string"  "0"  "None"
 //       No usable source: the property is absent.
 //   "model"         DMI product_name, else the device tree's model
 //   "manufacturer"  DMI sys_vendor
-// The text is kept as the firmware has it (surrounding spaces included);
+// Text that is not UTF-8 makes any property absent. The text is kept as the
+// firmware has it (surrounding spaces included);
 // only the kernel's framing goes: the newline after a DMI value and the NUL
 // after a device-tree string. An absent property is a null Value.
 //
