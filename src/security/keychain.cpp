@@ -25,6 +25,8 @@
 #include <thread>
 #include <vector>
 
+#include "bus_session.h"
+
 namespace kivi {
 namespace {
 
@@ -98,6 +100,31 @@ struct GErrorHolder {
 
 std::mutex gServiceMutex;
 SecretService* gService = nullptr;  // guarded by gServiceMutex
+// How long the first call waits for a keyring to answer (a keyring started
+// by the bus for that call included), and how long any later call waits.
+constexpr guint kProbeTimeoutMs = 5000;
+constexpr gint kCallTimeoutMs = 10000;
+
+// Whether a Secret Service answers a ping on the session bus (starting it if
+// the bus can), asked over a private connection with a bounded wait. libsecret
+// connects through GDBus's shared connection, whose handshake has no time
+// limit: a bus that accepts the connection and then says nothing would hold
+// the caller forever.
+bool keyringAnswers() {
+  GErrorHolder e;
+  gchar* address = g_dbus_address_get_for_bus_sync(G_BUS_TYPE_SESSION, nullptr, &e.error);
+  if (!address) return false;
+  security::detail::BusSession session(kProbeTimeoutMs);
+  bool answered = session.connect(address, &e.error);
+  g_free(address);
+  if (answered) {
+    GVariant* reply = session.call("org.freedesktop.secrets", "/org/freedesktop/secrets",
+                                   "org.freedesktop.DBus.Peer", "Ping", nullptr, "()", &e.error);
+    answered = reply != nullptr;
+    if (reply) g_variant_unref(reply);
+  }
+  return answered;
+}
 
 // The Secret Service for one call: the process's proxy, used by one call at
 // a time. A call that fails on the bus drops the proxy, so that the next one
@@ -114,12 +141,15 @@ class Keyring {
     }
   }
 
-  // errSecNotAvailable when there is no session bus to reach.
+  // errSecNotAvailable when there is no session bus to reach or no keyring
+  // answers on it within kProbeTimeoutMs.
   OSStatus open() {
     if (!gService) {
+      if (!keyringAnswers()) return errSecNotAvailable;
       GErrorHolder e;
       gService = static_cast<SecretService*>(g_initable_new(
           refusingServiceType(), nullptr, &e.error, "flags", SECRET_SERVICE_NONE, nullptr));
+      if (gService) g_dbus_proxy_set_default_timeout(G_DBUS_PROXY(gService), kCallTimeoutMs);
     }
     return gService ? errSecSuccess : errSecNotAvailable;
   }

@@ -16,8 +16,12 @@
 #include <string>
 #include <vector>
 
+#include "bus_session.h"
+
 namespace kivi {
 namespace {
+
+using security::detail::BusSession;
 
 constexpr const char* kService = "net.reactivated.Fprint";
 constexpr const char* kManagerPath = "/net/reactivated/Fprint/Manager";
@@ -59,93 +63,6 @@ struct Probe {
   std::string busMessage;  // the bus's own error message, when there was one
 };
 
-// One connection to the bus and the calls made on it, each waited for on a
-// private main context. A timer on that context cancels whatever is under
-// way once the probe's time is up; every later step then fails at once.
-class BusSession {
- public:
-  BusSession() : context_(g_main_context_new()), cancellable_(g_cancellable_new()) {
-    g_main_context_push_thread_default(context_);
-    timer_ = g_timeout_source_new(kProbeTimeoutMs);
-    g_source_set_callback(timer_, &BusSession::expire, this, nullptr);
-    g_source_attach(timer_, context_);
-  }
-
-  ~BusSession() {
-    if (connection_) {
-      g_dbus_connection_close_sync(connection_, nullptr, nullptr);
-      g_object_unref(connection_);
-    }
-    g_source_destroy(timer_);
-    g_source_unref(timer_);
-    // Let the context release what the connection left queued on it (its
-    // "closed" notification holds a reference to the connection).
-    while (g_main_context_iteration(context_, FALSE)) {
-    }
-    g_main_context_pop_thread_default(context_);
-    g_object_unref(cancellable_);
-    g_main_context_unref(context_);
-  }
-
-  BusSession(const BusSession&) = delete;
-  BusSession& operator=(const BusSession&) = delete;
-
-  bool timedOut() const { return timedOut_; }
-
-  bool connect(const std::string& address, GError** error) {
-    GAsyncResult* result = wait([&](GAsyncReadyCallback done, gpointer data) {
-      g_dbus_connection_new_for_address(
-          address.c_str(),
-          static_cast<GDBusConnectionFlags>(G_DBUS_CONNECTION_FLAGS_AUTHENTICATION_CLIENT |
-                                            G_DBUS_CONNECTION_FLAGS_MESSAGE_BUS_CONNECTION),
-          nullptr, cancellable_, done, data);
-    });
-    connection_ = g_dbus_connection_new_for_address_finish(result, error);
-    g_object_unref(result);
-    return connection_ != nullptr;
-  }
-
-  // The reply (to be unreffed), or null with *error set. A reply of another
-  // type than `replyType` is an error too.
-  GVariant* call(const char* path, const char* interface, const char* method, GVariant* parameters,
-                 const char* replyType, GError** error) {
-    GAsyncResult* result = wait([&](GAsyncReadyCallback done, gpointer data) {
-      g_dbus_connection_call(connection_, kService, path, interface, method, parameters,
-                             G_VARIANT_TYPE(replyType), G_DBUS_CALL_FLAGS_NONE, kProbeTimeoutMs,
-                             cancellable_, done, data);
-    });
-    GVariant* reply = g_dbus_connection_call_finish(connection_, result, error);
-    g_object_unref(result);
-    return reply;
-  }
-
- private:
-  template <class Start>
-  GAsyncResult* wait(Start start) {
-    GAsyncResult* result = nullptr;
-    start(&BusSession::finished, &result);
-    while (!result) g_main_context_iteration(context_, TRUE);
-    return result;
-  }
-
-  static void finished(GObject*, GAsyncResult* result, gpointer data) {
-    *static_cast<GAsyncResult**>(data) = G_ASYNC_RESULT(g_object_ref(result));
-  }
-
-  static gboolean expire(gpointer data) {
-    auto* self = static_cast<BusSession*>(data);
-    self->timedOut_ = true;
-    g_cancellable_cancel(self->cancellable_);
-    return G_SOURCE_REMOVE;
-  }
-
-  GMainContext* context_;
-  GCancellable* cancellable_;
-  GSource* timer_ = nullptr;
-  GDBusConnection* connection_ = nullptr;
-  bool timedOut_ = false;
-};
-
 bool isRemoteError(const GError* error, const char* name) {
   if (!g_dbus_error_is_remote_error(error)) return false;
   gchar* remote = g_dbus_error_get_remote_error(error);
@@ -164,13 +81,13 @@ Probe failed(const BusSession& session, GError* error, const char* reason) {
 
 // Asks the service for its readers and for the user's fingers on each.
 Probe probeFingerprints() {
-  BusSession session;
+  BusSession session(kProbeTimeoutMs);
   GError* error = nullptr;
   if (!session.connect(systemBusAddress(), &error)) {
     return failed(session, error, "The system bus cannot be reached.");
   }
-  GVariant* reply =
-      session.call(kManagerPath, kManagerInterface, "GetDevices", nullptr, "(ao)", &error);
+  GVariant* reply = session.call(kService, kManagerPath, kManagerInterface, "GetDevices", nullptr,
+                                 "(ao)", &error);
   if (!reply) {
     const bool notRunning = isRemoteError(error, "org.freedesktop.DBus.Error.ServiceUnknown") ||
                             isRemoteError(error, "org.freedesktop.DBus.Error.NameHasNoOwner");
@@ -195,8 +112,9 @@ Probe probeFingerprints() {
   }
   const std::string user = currentUserName();
   for (const std::string& device : devices) {
-    GVariant* fingers = session.call(device.c_str(), kDeviceInterface, "ListEnrolledFingers",
-                                     g_variant_new("(s)", user.c_str()), "(as)", &error);
+    GVariant* fingers =
+        session.call(kService, device.c_str(), kDeviceInterface, "ListEnrolledFingers",
+                     g_variant_new("(s)", user.c_str()), "(as)", &error);
     if (!fingers && isRemoteError(error, kNoEnrolledPrints)) {
       g_clear_error(&error);
       continue;

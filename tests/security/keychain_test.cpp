@@ -6,7 +6,9 @@
 
 #include <fcntl.h>
 #include <gtest/gtest.h>
+#include <sys/socket.h>
 #include <sys/stat.h>
+#include <sys/un.h>
 
 #include <algorithm>
 #include <atomic>
@@ -219,6 +221,22 @@ TEST_F(KeychainTest, WithoutAKeyringEveryCallAnswersNotAvailableAtOnce) {
   }
 }
 
+TEST_F(KeychainTest, ABusThatNeverAnswersIsNotAvailableAfterABoundedWait) {
+  // Accepts the connection and never says a word.
+  const std::string name = "kivi-silent-keyring-" + std::to_string(::getpid());
+  sockaddr_un address{AF_UNIX, {}};
+  name.copy(address.sun_path + 1, sizeof address.sun_path - 2);
+  const int listener = ::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0);
+  ASSERT_EQ(::bind(listener, reinterpret_cast<sockaddr*>(&address),
+                   offsetof(sockaddr_un, sun_path) + 1 + name.size()),
+            0);
+  ASSERT_EQ(::listen(listener, 4), 0);
+  const ChildResult r = child("silent", {"DBUS_SESSION_BUS_ADDRESS=unix:abstract=" + name});
+  ::close(listener);
+  EXPECT_EQ(printed(r.output, "COPY"), "-25291") << r.output;
+  EXPECT_LT(std::stoi("0" + printed(r.output, "MILLISECONDS")), 15000) << r.output;
+}
+
 TEST_F(KeychainTest, ALockedKeyringIsNotAvailableAndNeverPrompts) {
   Keyring other;  // a keyring of its own, to lock
   ASSERT_EQ(other.failure, "");
@@ -246,15 +264,17 @@ TEST(KeychainChild, Run) {
   const std::string m = mode;
   if (m == "group") std::cout << "GROUP=" << SecDefaultAccessGroup() << std::endl;
   if (m == "add") std::cout << "ADD=" << SecItemAdd(query, nullptr) << std::endl;
-  if (m == "unavailable") {
+  if (m == "unavailable" || m == "silent") {
     const auto start = std::chrono::steady_clock::now();
     Value result;
     std::cout << "COPY=" << SecItemCopyMatching(query, &result) << std::endl;
-    std::cout << "ADD=" << SecItemAdd(query, &result) << std::endl;
-    std::cout << "DELETE=" << SecItemDelete(query) << std::endl;
-    Dictionary another = query;
-    another[kSecAttrAccount] = Value("another");
-    std::cout << "ADD_ANOTHER=" << SecItemAdd(another, nullptr) << std::endl;
+    if (m == "unavailable") {
+      std::cout << "ADD=" << SecItemAdd(query, &result) << std::endl;
+      std::cout << "DELETE=" << SecItemDelete(query) << std::endl;
+      Dictionary another = query;
+      another[kSecAttrAccount] = Value("another");
+      std::cout << "ADD_ANOTHER=" << SecItemAdd(another, nullptr) << std::endl;
+    }
     std::cout << "MILLISECONDS="
               << std::chrono::duration_cast<std::chrono::milliseconds>(
                      std::chrono::steady_clock::now() - start)

@@ -58,10 +58,12 @@
 // instead of the path it is mounted at, which changes from run to run.
 //
 // Availability. Without a reachable Secret Service (no session bus, or no
-// keyring daemon on it) every call answers errSecNotAvailable at once. The
-// calls never ask the user anything: a locked keyring is not unlocked and no
-// password dialog is shown, so an item found locked and an add into a locked
-// keyring answer errSecNotAvailable too.
+// keyring daemon on it) every call answers errSecNotAvailable at once. A bus
+// or keyring that accepts the call and never answers costs a call at most
+// 5 seconds on first use (10 seconds once the keyring has answered), then
+// errSecNotAvailable. The calls never ask the user anything: a locked keyring is not unlocked and
+// no password dialog is shown, so an item found locked and an add into a locked keyring answer
+// errSecNotAvailable too.
 //
 // Thread contract: every function may be called from any thread. The calls
 // block the calling thread for a round trip to the keyring daemon (D-Bus
