@@ -4,6 +4,7 @@
 #
 #   base <- dispatch, text <- net <- the SDK areas, tools, tests, bench, fuzz
 #   base <- system, security <- the SDK areas
+#   net <- process <- desktop <- the SDK areas
 set -euo pipefail
 cd "$(dirname "${BASH_SOURCE[0]}")/.."
 
@@ -15,6 +16,8 @@ declare -A allowed=(
   [net]="base dispatch text"
   [system]="base"
   [security]="base"
+  [process]="base dispatch text net system"
+  [desktop]="base dispatch text net system process"
 )
 
 status=0
