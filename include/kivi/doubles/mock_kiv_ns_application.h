@@ -1,0 +1,38 @@
+// MockKivNSApplication: a scriptable KivNSApplicationProtocol.
+//
+// activateIgnoringOtherApps() and terminate() call their callbacks, if set,
+// with the arguments unchanged; without them they do nothing, so no test
+// ever ends its own process by accident.
+//
+//   auto app = std::make_shared<kivi::MockKivNSApplication>();
+//   bool quit = false;
+//   app->terminateAppBlock = [&](const kivi::ObjectPtr&) { quit = true; };
+//   updater.setApplication(app);
+//
+// Thread contract: none; callbacks run synchronously on the calling thread.
+// Set the callbacks before handing the double out.
+#pragma once
+
+#include <functional>
+#include <string>
+
+#include "kivi/platform/kiv_ns_application_protocol.h"
+
+namespace kivi {
+
+class MockKivNSApplication : public Object, public KivNSApplicationProtocol {
+ public:
+  MockKivNSApplication() = default;
+
+  std::function<void(bool)> activateIgnoringOtherAppsBlock;
+  std::function<void(const ObjectPtr&)> terminateAppBlock;
+
+  void activateIgnoringOtherApps(bool flag) override {
+    if (activateIgnoringOtherAppsBlock) activateIgnoringOtherAppsBlock(flag);
+  }
+  void terminate(const ObjectPtr& sender) override {
+    if (terminateAppBlock) terminateAppBlock(sender);
+  }
+};
+
+}  // namespace kivi

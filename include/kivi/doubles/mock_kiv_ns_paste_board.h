@@ -1,0 +1,41 @@
+// MockKivNSPasteBoard: a scriptable KivNSPasteBoardProtocol.
+//
+// setString() answers pasteBoardServiceBlock and prepareForNewContents()
+// answers prepareForNewContentBlock; without them they answer false and 0.
+// Nothing reaches the real clipboard.
+//
+//   auto board = std::make_shared<kivi::MockKivNSPasteBoard>();
+//   std::string copied;
+//   board->pasteBoardServiceBlock = [&](const std::string& s, const kivi::NSPasteboardType&) {
+//     copied = s;
+//     return true;
+//   };
+//
+// Thread contract: none; callbacks run synchronously on the calling thread.
+// Set the callbacks before handing the double out.
+#pragma once
+
+#include <cstdint>
+#include <functional>
+#include <string>
+
+#include "kivi/platform/kiv_ns_paste_board_protocol.h"
+
+namespace kivi {
+
+class MockKivNSPasteBoard : public Object, public KivNSPasteBoardProtocol {
+ public:
+  MockKivNSPasteBoard() = default;
+
+  std::function<bool(const std::string&, const NSPasteboardType&)> pasteBoardServiceBlock;
+  std::function<std::int64_t(NSPasteboardContentsOptions)> prepareForNewContentBlock;
+
+  bool setString(const std::string& string, const NSPasteboardType& type) override {
+    return pasteBoardServiceBlock ? pasteBoardServiceBlock(string, type) : false;
+  }
+  std::int64_t prepareForNewContents(NSPasteboardContentsOptions options) override {
+    return prepareForNewContentBlock ? prepareForNewContentBlock(options) : 0;
+  }
+};
+
+}  // namespace kivi

@@ -1,0 +1,55 @@
+// MockKivNSWindow: a scriptable KivNSWindowProtocol.
+//
+// center(), makeKeyAndOrderFront() and close() call centerBlock,
+// makeKeyAndOrderFrontBlock and windowCloseBlock, if set, and do nothing
+// otherwise. contentViewController is a stored value, and so is title (the
+// empty string until set), which the double keeps for hosts that name their
+// windows.
+//
+//   auto window = std::make_shared<kivi::MockKivNSWindow>();
+//   bool shown = false;
+//   window->makeKeyAndOrderFrontBlock = [&](const kivi::ObjectPtr&) { shown = true; };
+//   onboarding.present(window);
+//
+// Thread contract: none; callbacks run synchronously on the calling thread.
+// Set the callbacks before handing the double out.
+#pragma once
+
+#include <functional>
+#include <memory>
+#include <string>
+
+#include "kivi/platform/kiv_ns_window_protocol.h"
+
+namespace kivi {
+
+class MockKivNSWindow : public Object, public KivNSWindowProtocol {
+ public:
+  MockKivNSWindow() = default;
+
+  std::function<void()> centerBlock;
+  std::function<void(const ObjectPtr&)> makeKeyAndOrderFrontBlock;
+  std::function<void()> windowCloseBlock;
+  std::string title;
+
+  std::shared_ptr<NSViewController> contentViewController() const override {
+    return contentViewController_;
+  }
+  void setContentViewController(std::shared_ptr<NSViewController> controller) override {
+    contentViewController_ = std::move(controller);
+  }
+  void center() override {
+    if (centerBlock) centerBlock();
+  }
+  void makeKeyAndOrderFront(const ObjectPtr& sender) override {
+    if (makeKeyAndOrderFrontBlock) makeKeyAndOrderFrontBlock(sender);
+  }
+  void close() override {
+    if (windowCloseBlock) windowCloseBlock();
+  }
+
+ private:
+  std::shared_ptr<NSViewController> contentViewController_;
+};
+
+}  // namespace kivi

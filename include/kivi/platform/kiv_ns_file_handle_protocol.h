@@ -1,0 +1,25 @@
+// KivNSFileHandleProtocol: the two operations of an open file that writers
+// (log sinks, exporters) need: writing data and closing.
+//
+// The library declares no implementation: a host passes an object of its
+// own (such as one over kivi::NSFileHandle) or MockKivNSFileHandle.
+//
+//   sink->writeData(kivi::Data(line.begin(), line.end()));
+//   sink->closeFile();
+//
+// Thread contract: that of the implementation.
+#pragma once
+
+#include "kivi/base/value.h"
+
+namespace kivi {
+
+class KivNSFileHandleProtocol {
+ public:
+  virtual ~KivNSFileHandleProtocol() = default;
+
+  virtual void closeFile() = 0;
+  virtual void writeData(const Data& data) = 0;
+};
+
+}  // namespace kivi

@@ -1,0 +1,49 @@
+// KivNSTaskProtocol: a child process as the older callers see it: a launch
+// path, arguments and working directory, launch, wait, and the exit status.
+// (KivNSProcessProtocol is the fuller interface that kivi::NSTask
+// implements.)
+//
+// The library implements it only by its double, MockNSTask; a host passes
+// an object of its own over kivi::NSTask.
+//
+//   task->setLaunchPath("/usr/bin/env");
+//   task->setArguments({"true"});
+//   task->launch();
+//   task->waitUntilExit();
+//   bool ok = task->terminationStatus() == 0;
+//
+// Thread contract: that of the implementation.
+#pragma once
+
+#include <cstdint>
+#include <string>
+#include <vector>
+
+#include "kivi/base/object.h"
+
+namespace kivi {
+
+class KivNSTaskProtocol {
+ public:
+  virtual ~KivNSTaskProtocol() = default;
+
+  // The base object interface.
+  virtual std::string description() const = 0;
+
+  virtual void launch() = 0;
+  virtual void waitUntilExit() = 0;
+  virtual std::int32_t terminationStatus() const = 0;
+  virtual std::string launchPath() const = 0;
+  virtual void setLaunchPath(std::string path) = 0;
+  virtual std::string currentDirectoryPath() const = 0;
+  virtual void setCurrentDirectoryPath(std::string path) = 0;
+  virtual std::vector<std::string> arguments() const = 0;
+  virtual void setArguments(std::vector<std::string> arguments) = 0;
+  // An NSPipe, an NSFileHandle or null.
+  virtual ObjectPtr standardOutput() const = 0;
+  virtual void setStandardOutput(ObjectPtr stream) = 0;
+  virtual ObjectPtr standardError() const = 0;
+  virtual void setStandardError(ObjectPtr stream) = 0;
+};
+
+}  // namespace kivi

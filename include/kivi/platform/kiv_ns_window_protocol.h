@@ -1,0 +1,33 @@
+// KivNSWindowProtocol: a top-level window that shows one view controller.
+//
+// Linux toolkits own windows, so the library has no default implementation:
+// a host implements the interface over its toolkit (or uses MockKivNSWindow
+// in tests).
+//
+//   window->setContentViewController(consentScreen);
+//   window->center();
+//   window->makeKeyAndOrderFront(nullptr);
+//
+// Thread contract: call on the main thread.
+#pragma once
+
+#include <memory>
+
+#include "kivi/platform/platform_types.h"
+
+namespace kivi {
+
+class KivNSWindowProtocol {
+ public:
+  virtual ~KivNSWindowProtocol() = default;
+
+  virtual std::shared_ptr<NSViewController> contentViewController() const = 0;
+  virtual void setContentViewController(std::shared_ptr<NSViewController> controller) = 0;
+  virtual void center() = 0;
+  // Shows the window in front and gives it the keyboard; `sender` (null for
+  // none) is who asked.
+  virtual void makeKeyAndOrderFront(const ObjectPtr& sender) = 0;
+  virtual void close() = 0;
+};
+
+}  // namespace kivi

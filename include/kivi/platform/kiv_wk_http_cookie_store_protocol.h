@@ -1,0 +1,36 @@
+// KivWKHTTPCookieStoreProtocol: the cookie store of an embedded web view,
+// whose operations complete asynchronously.
+//
+// The library implements it only by its double, MockKivWKHTTPCookieStore; a
+// host implements it over its web view's cookie manager.
+//
+//   store->getAllCookies([](const std::vector<kivi::HTTPCookiePtr>& cookies) {
+//     for (const auto& c : cookies) inspect(c);
+//   });
+//   store->setCookie(sessionCookie, [] { reload(); });
+//
+// Thread contract: that of the implementation; the web view's store is used
+// on the main thread and completes there.
+#pragma once
+
+#include <functional>
+#include <string>
+#include <vector>
+
+#include "kivi/net/http_cookie.h"
+
+namespace kivi {
+
+class KivWKHTTPCookieStoreProtocol {
+ public:
+  virtual ~KivWKHTTPCookieStoreProtocol() = default;
+
+  // The base object interface.
+  virtual std::string description() const = 0;
+
+  virtual void getAllCookies(
+      std::function<void(const std::vector<HTTPCookiePtr>&)> completionHandler) = 0;
+  virtual void setCookie(const HTTPCookiePtr& cookie, std::function<void()> completionHandler) = 0;
+};
+
+}  // namespace kivi
