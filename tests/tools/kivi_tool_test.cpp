@@ -227,7 +227,11 @@ TEST(KiviToolTest, DemoFinishesAndShowsTransitionsAndEveryRestStatus) {
            {"admin", "status AccessDenied (http 403)"},
            {"status.txt", "status InvalidContentType (http 200)"},
            {"broken", "status InvalidServerResponse (http 200)"},
-           {"slow", "status Cancelled"}}) {
+           {"slow", "status Cancelled"},
+           {"process", "runBlock: /usr/bin/tar czf /tmp/kivi-support.tar.gz -C /var/log/kivi ."},
+           {"workspace", "activateFileViewerSelectingBlock: file:///tmp/kivi-support.tar.gz"},
+           {"archiver", "tar answered status 0: archive shown"},
+           {"archiver", "tar answered status 2: nothing shown"}}) {
     expected.push_back(line(who, what));
   }
   expected.push_back(

@@ -13,6 +13,7 @@
 #include <thread>
 
 #include "command.h"
+#include "demo_doubles.h"
 #include "demo_timing.h"
 #include "journal.h"
 #include "kivi/base/error.h"
@@ -378,6 +379,7 @@ int runDemo(const std::vector<std::string>& args, std::ostream& out, std::ostrea
 
   if (int failed = runRestCalls(journal, *printer, err)) return failed;
   if (int failed = runTimingDemo(out, err)) return failed;
+  if (int failed = runDoublesDemo(out, err)) return failed;
 
   out << "\nParked workflows were released in this order:";
   for (const auto& name : released) out << " " << name;
@@ -405,7 +407,10 @@ Command demoCommand() {
           "fires only while the main run loop runs in its mode, a main-thread\n"
           "KivRunLoopSemaphore wait during which main-queue work runs, a\n"
           "KivKeyValueObserver reporting an operation's \"isFinished\" on a chosen\n"
-          "queue, and two `kivi lock` child processes taking turns on one lock.\n",
+          "queue, and two `kivi lock` child processes taking turns on one lock.\n\n"
+          "Finally, a host component that runs tar and shows the archive in the file\n"
+          "manager is handed MockKivProcessFactory and MockKivNSWorkspace instead of the\n"
+          "real services: their callbacks answer, and nothing is started or opened.\n",
           runDemo};
 }
 
