@@ -7,30 +7,18 @@
 #include <vector>
 
 #include "desktop/desktop_fixture.h"
+#include "tools/tool_run.h"
 
 namespace kivi {
 namespace {
 
-struct ToolRun {
-  int exit = -1;
-  std::string err;
-};
+using testing::ToolRun;
 
 class DesktopCommandsTest : public testing::DesktopTest {
  protected:
   // Runs the tool in this test's environment (its bus, its $PATH); killed
   // after 20 seconds (exit 124).
-  ToolRun kivi(const std::vector<std::string>& args) {
-    std::string command = "/usr/bin/timeout -k 5 20 '" + std::string(KIVI_TOOL_PATH) + "'";
-    for (const auto& arg : args) {
-      std::string quoted = "'";
-      for (char c : arg) quoted += c == '\'' ? std::string("'\\''") : std::string(1, c);
-      command += " " + quoted + "'";
-    }
-    command += " </dev/null >/dev/null 2>" + dir_ + "/tool.err";
-    const int status = std::system(command.c_str());
-    return {WIFEXITED(status) ? WEXITSTATUS(status) : -1, read(dir_ + "/tool.err")};
-  }
+  ToolRun kivi(const std::vector<std::string>& args) { return testing::kivi(args); }
 };
 
 TEST_F(DesktopCommandsTest, OpenHandsURLsAndPathsToTheDesktop) {

@@ -12,45 +12,16 @@
 #include <vector>
 
 #include "test_servers.h"
+#include "tools/tool_run.h"
 
 namespace kivi {
 namespace {
 
 using testing::HttpServer;
 
-struct ToolRun {
-  int exit = -1;
-  std::string out, err;
-};
-
-std::string quoted(const std::string& arg) {
-  std::string q = "'";
-  for (char c : arg) q += c == '\'' ? std::string("'\\''") : std::string(1, c);
-  return q + "'";
-}
-
-std::string slurp(const std::string& path) {
-  std::ostringstream text;
-  text << std::ifstream(path).rdbuf();
-  return text.str();
-}
-
-// Runs the tool; one that is still running after `deadline` seconds is
-// killed and reported with exit code 124.
-ToolRun kivi(const std::vector<std::string>& args, const std::string& input = "",
-             int deadline = 20) {
-  // ctest runs test cases as parallel processes: one set of files each.
-  const std::string base = ::testing::TempDir() + "kivi_" + std::to_string(::getpid()) + "_";
-  std::ofstream(base + "in") << input;
-  std::string command = "timeout -k 5 " + std::to_string(deadline) + " " + quoted(KIVI_TOOL_PATH);
-  for (const auto& arg : args) command += " " + quoted(arg);
-  command += " <" + base + "in >" + base + "out 2>" + base + "err";
-  const int status = std::system(command.c_str());
-  ToolRun run{WIFEXITED(status) ? WEXITSTATUS(status) : -1, slurp(base + "out"),
-              slurp(base + "err")};
-  for (const char* name : {"in", "out", "err"}) std::remove((base + name).c_str());
-  return run;
-}
+using testing::kivi;
+using testing::ToolRun;
+const auto& quoted = testing::shellQuoted;
 
 TEST(KiviToolTest, GetClassifiesEachAnswerAndExitsWithItsStatus) {
   HttpServer server;

@@ -12,36 +12,14 @@
 #include <string>
 #include <vector>
 
+#include "tools/tool_run.h"
+
 namespace kivi {
 namespace {
 
-struct Run {
-  int exit = -1;
-  std::string out, err;
-};
-
-std::string quoted(const std::string& arg) {
-  std::string q = "'";
-  for (char c : arg) q += c == '\'' ? std::string("'\\''") : std::string(1, c);
-  return q + "'";
-}
-
-std::string slurp(const std::string& path) {
-  std::ostringstream text;
-  text << std::ifstream(path).rdbuf();
-  return text.str();
-}
-
-Run kiviRun(const std::vector<std::string>& args) {
-  const std::string base = ::testing::TempDir() + "kivi_run_" + std::to_string(::getpid()) + "_";
-  std::string command = "timeout -k 5 60 " + quoted(KIVI_TOOL_PATH) + " run";
-  for (const auto& arg : args) command += " " + quoted(arg);
-  command += " </dev/null >" + base + "out 2>" + base + "err";
-  const int status = std::system(command.c_str());
-  Run run{WIFEXITED(status) ? WEXITSTATUS(status) : -1, slurp(base + "out"), slurp(base + "err")};
-  std::remove((base + "out").c_str());
-  std::remove((base + "err").c_str());
-  return run;
+testing::ToolRun kiviRun(std::vector<std::string> args) {
+  args.insert(args.begin(), "run");
+  return testing::kivi(args, "", 60);
 }
 
 TEST(KiviRunTest, PassesOutputThroughAndExitsWithTheChildsStatus) {
