@@ -14,7 +14,7 @@
 #include <system_error>
 #include <utility>
 
-#include "desktop_bus.h"
+#include "bounded_bus.h"
 #include "desktop_entries.h"
 #include "kivi/dispatch/dispatch_queue.h"
 #include "kivi/net/kiv_ns_url_protocol.h"

@@ -13,7 +13,7 @@
 #include <thread>
 #include <utility>
 
-#include "desktop_bus.h"
+#include "bounded_bus.h"
 #include "kivi/desktop/ns_bundle.h"
 #include "kivi/dispatch/dispatch_clock.h"
 #include "kivi/dispatch/dispatch_queue.h"

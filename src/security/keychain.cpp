@@ -25,7 +25,7 @@
 #include <thread>
 #include <vector>
 
-#include "bus_session.h"
+#include "bounded_bus.h"
 
 namespace kivi {
 namespace {
@@ -112,14 +112,12 @@ constexpr gint kCallTimeoutMs = 10000;
 // the caller forever.
 bool keyringAnswers() {
   GErrorHolder e;
-  gchar* address = g_dbus_address_get_for_bus_sync(G_BUS_TYPE_SESSION, nullptr, &e.error);
-  if (!address) return false;
-  security::detail::BusSession session(kProbeTimeoutMs);
-  bool answered = session.connect(address, &e.error);
-  g_free(address);
+  detail::BoundedBus session{std::chrono::milliseconds(kProbeTimeoutMs)};
+  bool answered = session.connect(&e.error);
   if (answered) {
-    GVariant* reply = session.call("org.freedesktop.secrets", "/org/freedesktop/secrets",
-                                   "org.freedesktop.DBus.Peer", "Ping", nullptr, "()", &e.error);
+    GVariant* reply =
+        session.call("org.freedesktop.secrets", "/org/freedesktop/secrets",
+                     "org.freedesktop.DBus.Peer", "Ping", nullptr, "()", nullptr, &e.error);
     answered = reply != nullptr;
     if (reply) g_variant_unref(reply);
   }

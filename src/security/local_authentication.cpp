@@ -10,18 +10,19 @@
 #include <unistd.h>
 
 #include <cerrno>
+#include <chrono>
 #include <cstdlib>
 #include <cstring>
 #include <mutex>
 #include <string>
 #include <vector>
 
-#include "bus_session.h"
+#include "bounded_bus.h"
 
 namespace kivi {
 namespace {
 
-using security::detail::BusSession;
+using detail::BoundedBus;
 
 constexpr const char* kService = "net.reactivated.Fprint";
 constexpr const char* kManagerPath = "/net/reactivated/Fprint/Manager";
@@ -71,7 +72,7 @@ bool isRemoteError(const GError* error, const char* name) {
   return same;
 }
 
-Probe failed(const BusSession& session, GError* error, const char* reason) {
+Probe failed(const BoundedBus& session, GError* error, const char* reason) {
   Probe probe;
   probe.reason = session.timedOut() ? "The fingerprint service did not answer in time." : reason;
   if (error) probe.busMessage = error->message;
@@ -81,13 +82,13 @@ Probe failed(const BusSession& session, GError* error, const char* reason) {
 
 // Asks the service for its readers and for the user's fingers on each.
 Probe probeFingerprints() {
-  BusSession session(kProbeTimeoutMs);
+  BoundedBus session{std::chrono::milliseconds(kProbeTimeoutMs)};
   GError* error = nullptr;
   if (!session.connect(systemBusAddress(), &error)) {
     return failed(session, error, "The system bus cannot be reached.");
   }
   GVariant* reply = session.call(kService, kManagerPath, kManagerInterface, "GetDevices", nullptr,
-                                 "(ao)", &error);
+                                 "(ao)", nullptr, &error);
   if (!reply) {
     const bool notRunning = isRemoteError(error, "org.freedesktop.DBus.Error.ServiceUnknown") ||
                             isRemoteError(error, "org.freedesktop.DBus.Error.NameHasNoOwner");
@@ -114,7 +115,7 @@ Probe probeFingerprints() {
   for (const std::string& device : devices) {
     GVariant* fingers =
         session.call(kService, device.c_str(), kDeviceInterface, "ListEnrolledFingers",
-                     g_variant_new("(s)", user.c_str()), "(as)", &error);
+                     g_variant_new("(s)", user.c_str()), "(as)", nullptr, &error);
     if (!fingers && isRemoteError(error, kNoEnrolledPrints)) {
       g_clear_error(&error);
       continue;

@@ -1,4 +1,4 @@
-#include "desktop_bus.h"
+#include "bounded_bus.h"
 
 #include <cstdlib>
 #include <cstring>
@@ -62,6 +62,10 @@ bool BoundedBus::connect(GError** error) {
     g_set_error_literal(error, G_IO_ERROR, G_IO_ERROR_NOT_FOUND, "No session bus address.");
     return false;
   }
+  return connect(address, error);
+}
+
+bool BoundedBus::connect(const std::string& address, GError** error) {
   GAsyncResult* result = wait([&](GAsyncReadyCallback done, gpointer data) {
     g_dbus_connection_new_for_address(
         address.c_str(),

@@ -1,7 +1,10 @@
-// Calls to the desktop's services on the session bus, each on a connection of
-// its own whose every step is waited for on a private main context, so that
-// one deadline bounds the whole exchange and nothing is shared with GIO's
-// process-wide connections (or with a bus address that changed since).
+// Internal to the layers that talk to D-Bus services (security, desktop): a
+// conversation with a service on a connection of its own, whose every step is
+// waited for on a private main context pushed as the calling thread's default
+// while the BoundedBus lives, so that one deadline bounds the whole exchange
+// (a bus or service that never answers costs at most the timeout) and nothing
+// is shared with GIO's process-wide connections (or with a bus address that
+// changed since).
 #pragma once
 
 #include <gio/gio.h>
@@ -29,7 +32,9 @@ class BoundedBus {
   // True once the deadline passed (every later step then fails at once).
   bool timedOut() const { return timedOut_; }
 
-  // Connects to the session bus; false with *error set.
+  // Connects to the bus at `address`; false with *error set.
+  bool connect(const std::string& address, GError** error);
+  // Connects to the session bus (sessionBusAddress()); false with *error set.
   bool connect(GError** error);
 
   // The reply (to be unreffed), or null with *error set. `parameters` is
