@@ -215,7 +215,12 @@ struct UNUserNotificationCenter::Impl {
     }
     std::string reason, debug;
     GDBusConnection* connection = listener->connection(&reason, &debug);
-    if (!connection) *error = notAllowed(reason, debug);
+    if (!connection) {
+      *error = notAllowed(reason, debug);
+      // Its thread has nothing left to hear: join it now rather than at the
+      // next attempt, which may never come.
+      listener.reset();
+    }
     return connection;
   }
 
