@@ -31,6 +31,9 @@ done
 #   libsecret-1-dev: the user's Secret Service keyring.
 #   gnome-keyring, dbus-daemon, python3-dbusmock: a real keyring and a
 #   scripted fingerprint service on a private bus, started by the tests.
+#   doxygen: the API documentation, checked for warnings by the test script.
+#   dpkg-dev, file: cpack's Debian package (dpkg-shlibdeps names the
+#   runtime package's dependencies).
 PACKAGES=(
   cmake
   ninja-build
@@ -55,6 +58,9 @@ PACKAGES=(
   gnome-keyring
   dbus-daemon
   python3-dbusmock
+  doxygen
+  dpkg-dev
+  file
 )
 # The peer benchmark's other clients and JSON readers (Qt 6 Core and Network,
 # POCO Net and NetSSL, RapidJSON); never needed by the library or its tests.

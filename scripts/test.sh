@@ -1,19 +1,23 @@
 #!/usr/bin/env bash
 # Builds the library and runs its tests, stage by stage:
-#   1. normal build (build/, RelWithDebInfo), every suite;
-#   2. AddressSanitizer + UBSan build (build-asan/), every suite;
-#   3. ThreadSanitizer build (build-tsan/), the suites labelled "concurrency";
-#   4. libFuzzer build (build-fuzz/, clang), each fuzz target for 20 s.
+#   1. normal build (build/, RelWithDebInfo, shared library), every suite;
+#   2. the installed package (scripts/check_install.sh): every header alone,
+#      every public symbol exported, the examples built against the installed
+#      package through CMake and pkg-config and run, a static build, the API
+#      documentation without a Doxygen warning;
+#   3. AddressSanitizer + UBSan build (build-asan/), every suite;
+#   4. ThreadSanitizer build (build-tsan/), the suites labelled "concurrency";
+#   5. libFuzzer build (build-fuzz/, clang), each fuzz target for 20 s.
 # Ends with "N passed, 0 failed" (N: ctest tests over all stages; ", K skipped"
 # follows when some were skipped), or exits non-zero at the first failure.
 #
 #   scripts/test.sh [--quick] [--no-tsan] [--no-fuzz]
-#     --quick    stage 1 only
-#     --no-tsan  skip stage 3
-#     --no-fuzz  skip stage 4
+#     --quick    stages 1 and 2 only
+#     --no-tsan  skip stage 4
+#     --no-fuzz  skip stage 5
 set -euo pipefail
 
-usage() { sed -n '2,13s/^# \{0,1\}//p' "${BASH_SOURCE[0]}"; }
+usage() { sed -n '2,17s/^# \{0,1\}//p' "${BASH_SOURCE[0]}"; }
 
 run_sanitizers=1
 run_tsan=1
@@ -114,18 +118,25 @@ concurrency_targets() {
 }
 
 # --- 1. Normal build ---------------------------------------------------------
-begin_stage "1/4 normal build (build/, RelWithDebInfo)"
+begin_stage "1/5 normal build (build/, RelWithDebInfo)"
 bash scripts/check_layers.sh || fail "a layer includes from a layer above it"
-configure build -DCMAKE_BUILD_TYPE=RelWithDebInfo
+configure build -DCMAKE_BUILD_TYPE=RelWithDebInfo -DBUILD_SHARED_LIBS=ON
 build build
 run_ctest build
+end_stage
+
+# --- 2. The installed package ------------------------------------------------
+begin_stage "2/5 installed package, examples, documentation"
+bash scripts/check_install.sh build || fail "the installed package"
 end_stage
 
 # --- 2. AddressSanitizer + UBSan -----------------------------------------------
 if ((run_sanitizers)); then
   # Debug: the quickest to compile, and the sanitizers report exact lines.
-  begin_stage "2/4 AddressSanitizer + UBSan (build-asan/, Debug)"
-  configure build-asan -DCMAKE_BUILD_TYPE=Debug -DKIVI_SANITIZER=address -DKIVI_BUILD_BENCH=OFF
+  # The sanitizer builds make only the static library: the suites link it.
+  begin_stage "3/5 AddressSanitizer + UBSan (build-asan/, Debug)"
+  configure build-asan -DCMAKE_BUILD_TYPE=Debug -DKIVI_SANITIZER=address -DKIVI_BUILD_BENCH=OFF \
+    -DBUILD_SHARED_LIBS=OFF
   build build-asan
   run_ctest build-asan
   end_stage
@@ -133,9 +144,9 @@ fi
 
 # --- 3. ThreadSanitizer, concurrency suites ------------------------------------
 if ((run_tsan)); then
-  begin_stage "3/4 ThreadSanitizer, concurrency suites (build-tsan/, RelWithDebInfo)"
+  begin_stage "4/5 ThreadSanitizer, concurrency suites (build-tsan/, RelWithDebInfo)"
   configure build-tsan -DCMAKE_BUILD_TYPE=RelWithDebInfo -DKIVI_SANITIZER=thread \
-    -DKIVI_BUILD_BENCH=OFF -DKIVI_BUILD_TOOLS=OFF
+    -DKIVI_BUILD_BENCH=OFF -DKIVI_BUILD_TOOLS=OFF -DBUILD_SHARED_LIBS=OFF
   # Only the suites that run here; everything when they cannot be told apart.
   mapfile -t tsan_targets < <(concurrency_targets build-tsan)
   build build-tsan "${tsan_targets[@]}"
@@ -148,12 +159,12 @@ shopt -s nullglob
 fuzz_sources=(fuzz/*.cpp)
 shopt -u nullglob
 if ((run_fuzz && ${#fuzz_sources[@]} > 0)); then
-  begin_stage "4/4 libFuzzer, 20 s per target (build-fuzz/, clang, ASan + UBSan)"
+  begin_stage "5/5 libFuzzer, 20 s per target (build-fuzz/, clang, ASan + UBSan)"
   # fuzzer-no-link gives the library the coverage instrumentation the
   # fuzzers steer by.
   configure build-fuzz -DCMAKE_BUILD_TYPE=RelWithDebInfo -DCMAKE_CXX_COMPILER=clang++ \
     -DKIVI_BUILD_FUZZ=ON -DKIVI_BUILD_TESTS=OFF -DKIVI_BUILD_BENCH=OFF -DKIVI_BUILD_TOOLS=OFF \
-    -DKIVI_SANITIZER=address -DCMAKE_CXX_FLAGS=-fsanitize=fuzzer-no-link
+    -DKIVI_SANITIZER=address -DCMAKE_CXX_FLAGS=-fsanitize=fuzzer-no-link -DBUILD_SHARED_LIBS=OFF
   build build-fuzz
   for source in "${fuzz_sources[@]}"; do
     name=$(basename "$source" .cpp)
@@ -177,7 +188,7 @@ if ((run_fuzz && ${#fuzz_sources[@]} > 0)); then
   done
   end_stage
 elif ((run_fuzz)); then
-  printf '\n==== 4/4 libFuzzer: no fuzz targets in fuzz/, skipped ====\n'
+  printf '\n==== 5/5 libFuzzer: no fuzz targets in fuzz/, skipped ====\n'
 fi
 
 printf '\n==== Summary ====\n'

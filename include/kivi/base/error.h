@@ -13,8 +13,15 @@
 
 #include "kivi/base/object.h"
 #include "kivi/base/value.h"
+#include "kivi/export.h"
 
 namespace kivi {
+
+// Error domains with the platform's names that several areas use; each area
+// names its own codes.
+inline constexpr const char* CocoaErrorDomain = "NSCocoaErrorDomain";
+// errno values.
+inline constexpr const char* POSIXErrorDomain = "NSPOSIXErrorDomain";
 
 // User-info keys, with the platform's names.
 inline constexpr const char* LocalizedDescriptionKey = "NSLocalizedDescription";
@@ -24,7 +31,7 @@ inline constexpr const char* URLErrorFailingURLErrorKey = "NSErrorFailingURLKey"
 inline constexpr const char* URLErrorFailingURLStringErrorKey = "NSErrorFailingURLStringKey";
 inline constexpr const char* DebugDescriptionErrorKey = "NSDebugDescription";
 
-class Error final : public Object {
+class KIVI_EXPORT Error final : public Object {
  public:
   Error(std::string domain, std::int64_t code, Dictionary userInfo = {});
   static std::shared_ptr<const Error> create(std::string domain, std::int64_t code,
@@ -43,7 +50,7 @@ class Error final : public Object {
   std::string description() const override;
 
   // Same domain, code and user info.
-  friend bool operator==(const Error& a, const Error& b) noexcept;
+  friend KIVI_EXPORT bool operator==(const Error& a, const Error& b) noexcept;
 
  private:
   const std::string domain_;

@@ -42,6 +42,7 @@
 #include <string_view>
 
 #include "kivi/base/value.h"
+#include "kivi/export.h"
 
 namespace kivi {
 
@@ -60,7 +61,7 @@ inline constexpr const char* KeyValueChangeNotificationIsPriorKey = "notificatio
 // The only change kind this object model produces.
 inline constexpr std::int64_t KeyValueChangeSetting = 1;
 
-class Object : public std::enable_shared_from_this<Object> {
+class KIVI_EXPORT Object : public std::enable_shared_from_this<Object> {
  public:
   virtual ~Object();
   Object(const Object&) = delete;

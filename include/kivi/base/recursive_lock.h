@@ -12,10 +12,11 @@
 #include <string>
 
 #include "kivi/base/object.h"
+#include "kivi/export.h"
 
 namespace kivi {
 
-class RecursiveLock : public Object {
+class KIVI_EXPORT RecursiveLock : public Object {
  public:
   RecursiveLock() = default;
 

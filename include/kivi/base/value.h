@@ -58,6 +58,8 @@
 #include <utility>
 #include <vector>
 
+#include "kivi/export.h"
+
 namespace kivi {
 
 class Object;
@@ -74,14 +76,14 @@ class DocumentBuilder;
 using URLPtr = std::shared_ptr<const URL>;
 
 // The platform's NSNull.
-struct Null {
-  friend bool operator==(Null, Null) { return true; }
+struct KIVI_EXPORT Null {
+  friend KIVI_EXPORT bool operator==(Null, Null) { return true; }
 };
 
 using Data = std::vector<std::uint8_t>;
 
 // A point in time: seconds since 1970-01-01T00:00:00Z.
-struct Date {
+struct KIVI_EXPORT Date {
   double timeIntervalSince1970 = 0;
   friend auto operator<=>(const Date&, const Date&) = default;
 
@@ -104,7 +106,7 @@ struct Date {
 // A number with the flavour it was made with (bool, signed, unsigned or
 // floating point), like the platform's NSNumber. Two numbers are equal when
 // their values are equal, whatever their flavours (true == 1).
-class Number {
+class KIVI_EXPORT Number {
  public:
   enum class Type : std::uint8_t { Bool, Int, UInt, Double };
 
@@ -126,7 +128,7 @@ class Number {
   // "1", "-3", "2.5", "true"/"false" printed as 1/0 like the platform.
   std::string stringValue() const;
 
-  friend bool operator==(const Number& a, const Number& b) noexcept;
+  friend KIVI_EXPORT bool operator==(const Number& a, const Number& b) noexcept;
 
  private:
   Type type_;
@@ -144,7 +146,7 @@ class Number {
 //   kivi::String key = "name";
 //   std::string_view view = key;
 //   if (key == "name") ...
-class String {
+class KIVI_EXPORT String {
  public:
   static constexpr std::size_t kInlineCapacity = 22;
 
@@ -206,10 +208,16 @@ class String {
 
   // One overload per argument type, so that no comparison needs a
   // conversion that could go two ways.
-  friend bool operator==(const String& a, const String& b) noexcept { return a.view() == b.view(); }
-  friend bool operator==(const String& a, std::string_view b) noexcept { return a.view() == b; }
-  friend bool operator==(const String& a, const std::string& b) noexcept { return a.view() == b; }
-  friend bool operator==(const String& a, const char* b) noexcept {
+  friend KIVI_EXPORT bool operator==(const String& a, const String& b) noexcept {
+    return a.view() == b.view();
+  }
+  friend KIVI_EXPORT bool operator==(const String& a, std::string_view b) noexcept {
+    return a.view() == b;
+  }
+  friend KIVI_EXPORT bool operator==(const String& a, const std::string& b) noexcept {
+    return a.view() == b;
+  }
+  friend KIVI_EXPORT bool operator==(const String& a, const char* b) noexcept {
     return a.view() == std::string_view(b ? b : "");
   }
   friend std::strong_ordering operator<=>(const String& a, const String& b) noexcept {
@@ -234,7 +242,7 @@ class String {
     s += b.view();
     return s;
   }
-  friend std::ostream& operator<<(std::ostream& out, const String& s);
+  friend KIVI_EXPORT std::ostream& operator<<(std::ostream& out, const String& s);
 
  private:
   friend class detail::DocumentBuilder;
@@ -270,7 +278,7 @@ class String {
 };
 static_assert(sizeof(String) == 23);
 
-class Value {
+class KIVI_EXPORT Value {
  public:
   enum class Kind : std::uint8_t {
     Null,
@@ -392,7 +400,7 @@ class Value {
   // Equality as the platform's isEqual: numbers by value, URLs by text,
   // collections element-wise, objects by identity. Like description(), it
   // walks nested collections with a stack of its own, not recursion.
-  friend bool operator==(const Value& a, const Value& b) noexcept;
+  friend KIVI_EXPORT bool operator==(const Value& a, const Value& b) noexcept;
 
   // A readable rendering for logs and diagnostics (not JSON).
   std::string description() const;
@@ -441,7 +449,7 @@ static_assert(sizeof(Value) == 24);
 // An array of Values with the interface of a std::vector. An Array read from
 // a JSON document shares the document's storage and is read-only (reach it
 // through a const pointer); copying it gives an Array of its own.
-class Array {
+class KIVI_EXPORT Array {
  public:
   using value_type = Value;
   using size_type = std::size_t;
@@ -519,7 +527,7 @@ class Array {
   iterator erase(const_iterator position);
   iterator erase(const_iterator first, const_iterator last);
 
-  friend bool operator==(const Array& a, const Array& b) noexcept;
+  friend KIVI_EXPORT bool operator==(const Array& a, const Array& b) noexcept;
 
  private:
   friend class detail::DocumentBuilder;
@@ -534,7 +542,7 @@ class Array {
 
 // One member of a Dictionary: `first` is the key, `second` the value, as in a
 // std::map, so `for (const auto& [key, value] : dictionary)` reads the same.
-struct DictionaryEntry {
+struct KIVI_EXPORT DictionaryEntry {
   String first;
   Value second;
 };
@@ -542,7 +550,7 @@ struct DictionaryEntry {
 // A dictionary with string keys and the interface of a std::map, kept as an
 // array sorted by key (byte order). Iterators and element pointers stay valid
 // until the dictionary is next changed.
-class Dictionary {
+class KIVI_EXPORT Dictionary {
  public:
   using key_type = String;
   using mapped_type = Value;
@@ -656,7 +664,7 @@ class Dictionary {
   iterator erase(const_iterator position);
   size_type erase(std::string_view key);
 
-  friend bool operator==(const Dictionary& a, const Dictionary& b) noexcept;
+  friend KIVI_EXPORT bool operator==(const Dictionary& a, const Dictionary& b) noexcept;
 
  private:
   friend class detail::DocumentBuilder;

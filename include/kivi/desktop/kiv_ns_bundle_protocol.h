@@ -18,6 +18,7 @@
 #include <vector>
 
 #include "kivi/base/value.h"
+#include "kivi/export.h"
 
 namespace kivi {
 
@@ -30,7 +31,7 @@ inline constexpr std::int64_t NSBundleExecutableArchitectureARM64 = 0x0100000c;
 inline constexpr std::int64_t NSBundleExecutableArchitecturePPC = 0x00000012;
 inline constexpr std::int64_t NSBundleExecutableArchitecturePPC64 = 0x01000012;
 
-class KivNSBundleProtocol {
+class KIVI_EXPORT KivNSBundleProtocol {
  public:
   virtual ~KivNSBundleProtocol() = default;
 

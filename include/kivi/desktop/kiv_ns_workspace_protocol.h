@@ -26,6 +26,7 @@
 
 #include "kivi/base/error.h"
 #include "kivi/desktop/ns_workspace_open_configuration.h"
+#include "kivi/export.h"
 #include "kivi/net/url.h"
 
 namespace kivi {
@@ -41,7 +42,7 @@ inline constexpr std::int64_t FeatureUnsupportedError = 3328;
 using NSWorkspaceCompletionHandler =
     std::function<void(const std::shared_ptr<NSRunningApplication>& app, const ErrorPtr& error)>;
 
-class KivNSWorkspaceProtocol {
+class KIVI_EXPORT KivNSWorkspaceProtocol {
  public:
   virtual ~KivNSWorkspaceProtocol() = default;
 

@@ -21,10 +21,11 @@
 
 #include "kivi/base/error.h"
 #include "kivi/desktop/user_notifications.h"
+#include "kivi/export.h"
 
 namespace kivi {
 
-class KivUNUserNotificationCenterProtocol {
+class KIVI_EXPORT KivUNUserNotificationCenterProtocol {
  public:
   virtual ~KivUNUserNotificationCenterProtocol() = default;
 

@@ -58,10 +58,11 @@
 #include "kivi/base/object.h"
 #include "kivi/base/value.h"
 #include "kivi/desktop/kiv_ns_bundle_protocol.h"
+#include "kivi/export.h"
 
 namespace kivi {
 
-class NSBundle : public Object, public KivNSBundleProtocol {
+class KIVI_EXPORT NSBundle : public Object, public KivNSBundleProtocol {
  public:
   // The running application's bundle, read once.
   static std::shared_ptr<NSBundle> mainBundle();

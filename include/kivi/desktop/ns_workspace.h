@@ -73,13 +73,14 @@
 
 #include "kivi/base/object.h"
 #include "kivi/desktop/kiv_ns_workspace_protocol.h"
+#include "kivi/export.h"
 
 namespace kivi {
 
 // How long the workspace waits for the desktop's services and for xdg-open.
 inline constexpr std::chrono::milliseconds kNSWorkspaceTimeout{3000};
 
-class NSWorkspace : public Object, public KivNSWorkspaceProtocol {
+class KIVI_EXPORT NSWorkspace : public Object, public KivNSWorkspaceProtocol {
  public:
   static std::shared_ptr<NSWorkspace> sharedWorkspace();
 

@@ -23,9 +23,11 @@
 #include <string>
 #include <vector>
 
+#include "kivi/export.h"
+
 namespace kivi {
 
-struct NSWorkspaceOpenConfiguration {
+struct KIVI_EXPORT NSWorkspaceOpenConfiguration {
   bool activates = true;
   // Extra command-line arguments, after those the desktop entry names.
   std::vector<std::string> arguments;

@@ -66,12 +66,14 @@
 
 #include "kivi/base/object.h"
 #include "kivi/desktop/kiv_un_user_notification_center_protocol.h"
+#include "kivi/export.h"
 
 namespace kivi {
 
 inline constexpr std::chrono::milliseconds kUNNotificationCenterTimeout{3000};
 
-class UNUserNotificationCenter : public Object, public KivUNUserNotificationCenterProtocol {
+class KIVI_EXPORT UNUserNotificationCenter : public Object,
+                                             public KivUNUserNotificationCenterProtocol {
  public:
   static std::shared_ptr<UNUserNotificationCenter> currentNotificationCenter();
 

@@ -29,6 +29,7 @@
 #include "kivi/base/error.h"
 #include "kivi/base/object.h"
 #include "kivi/base/value.h"
+#include "kivi/export.h"
 
 namespace kivi {
 
@@ -100,7 +101,7 @@ inline constexpr const char* UNNotificationDefaultActionIdentifier =
 inline constexpr const char* UNNotificationDismissActionIdentifier =
     "com.apple.UNNotificationDismissActionIdentifier";
 
-struct UNNotificationContent {
+struct KIVI_EXPORT UNNotificationContent {
   std::string title;
   std::string subtitle;
   std::string body;
@@ -116,14 +117,14 @@ struct UNNotificationContent {
 
 // Delivers a notification `timeInterval` seconds after it was added; the
 // interval must be positive.
-struct UNTimeIntervalNotificationTrigger {
+struct KIVI_EXPORT UNTimeIntervalNotificationTrigger {
   double timeInterval = 0;
 
   friend bool operator==(const UNTimeIntervalNotificationTrigger&,
                          const UNTimeIntervalNotificationTrigger&) = default;
 };
 
-struct UNNotificationRequest {
+struct KIVI_EXPORT UNNotificationRequest {
   // A later request with the same identifier replaces the notification.
   std::string identifier;
   UNNotificationContent content;
@@ -133,7 +134,7 @@ struct UNNotificationRequest {
   friend bool operator==(const UNNotificationRequest&, const UNNotificationRequest&) = default;
 };
 
-struct UNNotificationAction {
+struct KIVI_EXPORT UNNotificationAction {
   std::string identifier;
   std::string title;
   UNNotificationActionOptions options = UNNotificationActionOptionNone;
@@ -141,7 +142,7 @@ struct UNNotificationAction {
   friend auto operator<=>(const UNNotificationAction&, const UNNotificationAction&) = default;
 };
 
-struct UNNotificationCategory {
+struct KIVI_EXPORT UNNotificationCategory {
   std::string identifier;
   std::vector<UNNotificationAction> actions;
   std::vector<std::string> intentIdentifiers;
@@ -153,7 +154,7 @@ struct UNNotificationCategory {
 };
 
 // A delivered notification: when it was delivered, and its request.
-class UNNotification : public Object {
+class KIVI_EXPORT UNNotification : public Object {
  public:
   UNNotification(Date date, UNNotificationRequest request)
       : date_(date), request_(std::move(request)) {}
@@ -170,7 +171,7 @@ class UNNotification : public Object {
 
 // The user's answer to a notification: the action they chose
 // (UNNotificationDefaultActionIdentifier for the notification itself).
-class UNNotificationResponse : public Object {
+class KIVI_EXPORT UNNotificationResponse : public Object {
  public:
   UNNotificationResponse(std::shared_ptr<UNNotification> notification, std::string actionIdentifier)
       : notification_(std::move(notification)), actionIdentifier_(std::move(actionIdentifier)) {}
@@ -186,7 +187,7 @@ class UNNotificationResponse : public Object {
 };
 
 // A response that carries text the user typed.
-class UNTextInputNotificationResponse : public UNNotificationResponse {
+class KIVI_EXPORT UNTextInputNotificationResponse : public UNNotificationResponse {
  public:
   UNTextInputNotificationResponse(std::shared_ptr<UNNotification> notification,
                                   std::string actionIdentifier, std::string userText)
@@ -203,7 +204,7 @@ class UNTextInputNotificationResponse : public UNNotificationResponse {
 
 // Receives what happens to the application's notifications. Both operations
 // do nothing by default but call their completion handler.
-class UNUserNotificationCenterDelegate {
+class KIVI_EXPORT UNUserNotificationCenterDelegate {
  public:
   virtual ~UNUserNotificationCenterDelegate() = default;
 

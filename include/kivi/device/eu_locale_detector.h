@@ -23,12 +23,13 @@
 
 #include "kivi/base/object.h"
 #include "kivi/device/eu_locale_detector_protocol.h"
+#include "kivi/export.h"
 
 namespace kivi {
 
 class TimeZone;
 
-class EULocaleDetector : public Object {
+class KIVI_EXPORT EULocaleDetector : public Object {
  public:
   EULocaleDetector() = delete;
 
@@ -40,7 +41,7 @@ class EULocaleDetector : public Object {
   static bool isEUTimeZone(const std::shared_ptr<const TimeZone>& timeZone);
 };
 
-class EULocaleDetector_Mac : public Object, public EULocaleDetectorProtocol {
+class KIVI_EXPORT EULocaleDetector_Mac : public Object, public EULocaleDetectorProtocol {
  public:
   EULocaleDetector_Mac() = default;
 

@@ -12,9 +12,11 @@
 
 #include <string>
 
+#include "kivi/export.h"
+
 namespace kivi {
 
-class EULocaleDetectorProtocol {
+class KIVI_EXPORT EULocaleDetectorProtocol {
  public:
   virtual ~EULocaleDetectorProtocol() = default;
 

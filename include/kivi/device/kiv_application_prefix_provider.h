@@ -25,10 +25,11 @@
 
 #include "kivi/base/error.h"
 #include "kivi/base/object.h"
+#include "kivi/export.h"
 
 namespace kivi {
 
-class KivApplicationPrefixProvider : public Object {
+class KIVI_EXPORT KivApplicationPrefixProvider : public Object {
  public:
   // The application identifier prefix, or null (an empty optional). When
   // `error` is non-null it receives the keychain's failure as an error in

@@ -32,6 +32,7 @@
 #include "kivi/base/error.h"
 #include "kivi/base/object.h"
 #include "kivi/base/value.h"
+#include "kivi/export.h"
 
 namespace kivi {
 
@@ -44,7 +45,7 @@ inline constexpr std::uint64_t KivBiometricAuthTypeFaceID = 1;
 // The all-ones answer of the unsigned figures.
 inline constexpr std::uint64_t kKivDeviceUnknown = UINT64_MAX;
 
-class KivDevice : public Object {
+class KIVI_EXPORT KivDevice : public Object {
  public:
   KivDevice() = delete;
 

@@ -18,10 +18,11 @@
 
 #include "kivi/base/object.h"
 #include "kivi/device/kiv_device_attributes_protocol.h"
+#include "kivi/export.h"
 
 namespace kivi {
 
-class KivDeviceAttributes : public Object, public KivDeviceAttributesProtocol {
+class KIVI_EXPORT KivDeviceAttributes : public Object, public KivDeviceAttributesProtocol {
  public:
   KivDeviceAttributes() = default;
 

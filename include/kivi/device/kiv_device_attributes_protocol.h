@@ -12,9 +12,11 @@
 #include <optional>
 #include <string>
 
+#include "kivi/export.h"
+
 namespace kivi {
 
-class KivDeviceAttributesProtocol {
+class KIVI_EXPORT KivDeviceAttributesProtocol {
  public:
   virtual ~KivDeviceAttributesProtocol() = default;
 

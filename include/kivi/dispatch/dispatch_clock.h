@@ -25,6 +25,8 @@
 #include <memory>
 #include <optional>
 
+#include "kivi/export.h"
+
 namespace kivi {
 
 using DispatchTime = std::chrono::steady_clock::time_point;
@@ -39,7 +41,7 @@ struct TimerState;
 
 // A re-armable timer: its handler runs once per schedule(), at or after the
 // deadline. Releasing the timer cancels it.
-class DispatchTimer {
+class KIVI_EXPORT DispatchTimer {
  public:
   ~DispatchTimer();
   DispatchTimer(const DispatchTimer&) = delete;
@@ -60,7 +62,7 @@ class DispatchTimer {
   std::shared_ptr<detail::TimerState> state_;
 };
 
-class DispatchClock : public std::enable_shared_from_this<DispatchClock> {
+class KIVI_EXPORT DispatchClock : public std::enable_shared_from_this<DispatchClock> {
  public:
   virtual ~DispatchClock();
   DispatchClock(const DispatchClock&) = delete;
@@ -105,7 +107,7 @@ class DispatchClock : public std::enable_shared_from_this<DispatchClock> {
 
 // A clock that moves only when told to. Starts at DispatchTime{} plus one
 // hour unless given a start.
-class ManualClock : public DispatchClock {
+class KIVI_EXPORT ManualClock : public DispatchClock {
  public:
   static std::shared_ptr<ManualClock> create();
   static std::shared_ptr<ManualClock> create(DispatchTime start);

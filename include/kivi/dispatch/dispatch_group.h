@@ -31,12 +31,13 @@
 #include "kivi/base/object.h"
 #include "kivi/dispatch/dispatch_clock.h"
 #include "kivi/dispatch/dispatch_qos.h"
+#include "kivi/export.h"
 
 namespace kivi {
 
 class KivDispatchQueueProtocol;
 
-class DispatchGroup : public Object {
+class KIVI_EXPORT DispatchGroup : public Object {
  public:
   DispatchGroup();
   ~DispatchGroup() override;

@@ -17,9 +17,11 @@
 #include <algorithm>
 #include <cstdint>
 
+#include "kivi/export.h"
+
 namespace kivi {
 
-struct DispatchQoS {
+struct KIVI_EXPORT DispatchQoS {
   // The classes, with the platform's numeric values.
   enum class QoSClass : std::uint32_t {
     userInteractive = 0x21,
@@ -61,7 +63,7 @@ inline constexpr DispatchQoS DispatchQoS::unspecified{QoSClass::unspecified};
 // A bit set, with the platform's bit values. Only `barrier` changes what a
 // queue does (see DispatchQueue); the others are accepted and kept with the
 // work item, since the pool has neither priorities nor per-thread contexts.
-struct DispatchWorkItemFlags {
+struct KIVI_EXPORT DispatchWorkItemFlags {
   std::uint64_t rawValue = 0;
 
   constexpr bool contains(DispatchWorkItemFlags other) const noexcept {

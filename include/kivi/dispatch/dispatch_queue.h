@@ -62,6 +62,7 @@
 #include "kivi/dispatch/dispatch_qos.h"
 #include "kivi/dispatch/dispatch_work_item.h"
 #include "kivi/dispatch/kiv_dispatch_queue_protocol.h"
+#include "kivi/export.h"
 
 namespace kivi {
 
@@ -69,7 +70,7 @@ namespace detail {
 struct DispatchQueueCore;
 }  // namespace detail
 
-class DispatchQueue : public Object, public KivDispatchQueueProtocol {
+class KIVI_EXPORT DispatchQueue : public Object, public KivDispatchQueueProtocol {
  public:
   enum class Attributes : std::uint8_t { serial, concurrent };
 

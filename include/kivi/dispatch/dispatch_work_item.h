@@ -30,12 +30,13 @@
 #include "kivi/base/object.h"
 #include "kivi/dispatch/dispatch_clock.h"
 #include "kivi/dispatch/dispatch_qos.h"
+#include "kivi/export.h"
 
 namespace kivi {
 
 class KivDispatchQueueProtocol;
 
-class DispatchWorkItem : public Object {
+class KIVI_EXPORT DispatchWorkItem : public Object {
  public:
   explicit DispatchWorkItem(std::function<void()> block);
   DispatchWorkItem(DispatchWorkItemFlags flags, std::function<void()> block);

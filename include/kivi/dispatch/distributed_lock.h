@@ -52,10 +52,11 @@
 #include "kivi/base/object.h"
 #include "kivi/base/value.h"
 #include "kivi/dispatch/kiv_ns_distribution_lock_protocol.h"
+#include "kivi/export.h"
 
 namespace kivi {
 
-class NSDistributedLock : public Object, public KivNSDistributionLockProtocol {
+class KIVI_EXPORT NSDistributedLock : public Object, public KivNSDistributionLockProtocol {
  public:
   // A lock represented by the directory `path`; null for an empty path, one
   // longer than PATH_MAX or one holding a NUL byte. Nothing is created yet.

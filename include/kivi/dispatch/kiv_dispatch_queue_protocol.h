@@ -35,12 +35,13 @@
 #include "kivi/dispatch/dispatch_group.h"
 #include "kivi/dispatch/dispatch_qos.h"
 #include "kivi/dispatch/dispatch_work_item.h"
+#include "kivi/export.h"
 
 namespace kivi {
 
 class DispatchQueue;
 
-class KivDispatchQueueProtocol {
+class KIVI_EXPORT KivDispatchQueueProtocol {
  public:
   virtual ~KivDispatchQueueProtocol() = default;
 

@@ -19,9 +19,11 @@
 
 #include <functional>
 
+#include "kivi/export.h"
+
 namespace kivi {
 
-class KivNSDistributionLockProtocol {
+class KIVI_EXPORT KivNSDistributionLockProtocol {
  public:
   virtual ~KivNSDistributionLockProtocol() = default;
 

@@ -11,6 +11,7 @@
 #include <vector>
 
 #include "kivi/base/value.h"
+#include "kivi/export.h"
 
 namespace kivi {
 
@@ -21,7 +22,7 @@ inline constexpr const char* NSDefaultRunLoopMode = "kCFRunLoopDefaultMode";
 // default mode is one).
 inline constexpr const char* NSRunLoopCommonModes = "kCFRunLoopCommonModes";
 
-class KivNSRunLoopProtocol {
+class KIVI_EXPORT KivNSRunLoopProtocol {
  public:
   virtual ~KivNSRunLoopProtocol() = default;
 

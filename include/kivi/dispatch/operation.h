@@ -34,6 +34,7 @@
 #include <vector>
 
 #include "kivi/base/object.h"
+#include "kivi/export.h"
 
 namespace kivi {
 
@@ -48,7 +49,7 @@ inline constexpr std::size_t kOperationStateSize = 272;
 class Operation;
 using OperationPtr = std::shared_ptr<Operation>;
 
-class Operation : public Object {
+class KIVI_EXPORT Operation : public Object {
  public:
   Operation();
   ~Operation() override;
@@ -108,7 +109,7 @@ class Operation : public Object {
 };
 
 // An operation whose work is a function.
-class BlockOperation : public Operation {
+class KIVI_EXPORT BlockOperation : public Operation {
  public:
   explicit BlockOperation(std::function<void()> block) : block_(std::move(block)) {}
   void main() override;

@@ -37,6 +37,7 @@
 #include "kivi/base/object.h"
 #include "kivi/dispatch/operation.h"
 #include "kivi/dispatch/operation_queue_protocol.h"
+#include "kivi/export.h"
 
 namespace kivi {
 
@@ -46,7 +47,7 @@ struct QueueCore;
 
 inline constexpr std::int64_t OperationQueueDefaultMaxConcurrentOperationCount = -1;
 
-class OperationQueue : public Object, public OperationQueueProtocol {
+class KIVI_EXPORT OperationQueue : public Object, public OperationQueueProtocol {
  public:
   // What "the queue decides" means here.
   static constexpr std::int64_t kDefaultConcurrency = 64;

@@ -16,13 +16,14 @@
 #include <vector>
 
 #include "kivi/base/object.h"
+#include "kivi/export.h"
 
 namespace kivi {
 
 class Operation;
 using OperationPtr = std::shared_ptr<Operation>;
 
-class OperationQueueProtocol {
+class KIVI_EXPORT OperationQueueProtocol {
  public:
   virtual ~OperationQueueProtocol() = default;
 

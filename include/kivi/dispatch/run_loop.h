@@ -46,13 +46,14 @@
 #include "kivi/base/value.h"
 #include "kivi/dispatch/kiv_ns_run_loop_protocol.h"
 #include "kivi/dispatch/timer.h"
+#include "kivi/export.h"
 
 namespace kivi {
 
 class RunLoop;
 using RunLoopPtr = std::shared_ptr<RunLoop>;
 
-class RunLoop : public Object, public KivNSRunLoopProtocol {
+class KIVI_EXPORT RunLoop : public Object, public KivNSRunLoopProtocol {
  public:
   // The calling thread's run loop, made on first use; it lives as long as
   // its thread.

@@ -15,10 +15,11 @@
 #pragma once
 
 #include "kivi/base/value.h"
+#include "kivi/export.h"
 
 namespace kivi {
 
-class Thread {
+class KIVI_EXPORT Thread {
  public:
   Thread() = delete;
 

@@ -25,6 +25,7 @@
 
 #include "kivi/base/object.h"
 #include "kivi/base/value.h"
+#include "kivi/export.h"
 
 namespace kivi {
 
@@ -35,7 +36,7 @@ namespace detail {
 struct TimerCore;
 }
 
-class Timer : public Object {
+class KIVI_EXPORT Timer : public Object {
  public:
   using Block = std::function<void(const TimerPtr& timer)>;
 

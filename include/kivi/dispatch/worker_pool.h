@@ -30,9 +30,11 @@
 #include <functional>
 #include <memory>
 
+#include "kivi/export.h"
+
 namespace kivi {
 
-class WorkerPool {
+class KIVI_EXPORT WorkerPool {
  public:
   static WorkerPool& shared();
 

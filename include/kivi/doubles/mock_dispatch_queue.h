@@ -28,10 +28,11 @@
 #include "kivi/base/object.h"
 #include "kivi/dispatch/dispatch_queue.h"
 #include "kivi/dispatch/kiv_dispatch_queue_protocol.h"
+#include "kivi/export.h"
 
 namespace kivi {
 
-class MockDispatchQueue : public Object, public KivDispatchQueueProtocol {
+class KIVI_EXPORT MockDispatchQueue : public Object, public KivDispatchQueueProtocol {
  public:
   MockDispatchQueue() = default;
 

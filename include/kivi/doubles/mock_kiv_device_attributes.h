@@ -17,10 +17,11 @@
 
 #include "kivi/base/object.h"
 #include "kivi/device/kiv_device_attributes_protocol.h"
+#include "kivi/export.h"
 
 namespace kivi {
 
-class MockKivDeviceAttributes : public Object, public KivDeviceAttributesProtocol {
+class KIVI_EXPORT MockKivDeviceAttributes : public Object, public KivDeviceAttributesProtocol {
  public:
   MockKivDeviceAttributes() = default;
 

@@ -16,11 +16,13 @@
 #include <string>
 
 #include "kivi/base/object.h"
+#include "kivi/export.h"
 #include "kivi/platform/kiv_feature_flag_provider_protocol.h"
 
 namespace kivi {
 
-class MockKivFeatureFlagProvider : public Object, public KivFeatureFlagProviderProtocol {
+class KIVI_EXPORT MockKivFeatureFlagProvider : public Object,
+                                               public KivFeatureFlagProviderProtocol {
  public:
   MockKivFeatureFlagProvider() = default;
 

@@ -12,12 +12,13 @@
 #pragma once
 
 #include "kivi/base/object.h"
+#include "kivi/export.h"
 #include "kivi/platform/kiv_http_header_provider_service_protocol.h"
 
 namespace kivi {
 
-class MockKivHttpHeaderProviderService : public Object,
-                                         public KivHttpHeaderProviderServiceProtocol {
+class KIVI_EXPORT MockKivHttpHeaderProviderService : public Object,
+                                                     public KivHttpHeaderProviderServiceProtocol {
  public:
   MockKivHttpHeaderProviderService() = default;
   MockKivHttpHeaderProviderService(StringDictionary httpMonitoringHeaders,

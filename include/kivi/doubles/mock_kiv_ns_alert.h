@@ -19,11 +19,12 @@
 #include <memory>
 #include <string>
 
+#include "kivi/export.h"
 #include "kivi/platform/kiv_ns_alert_protocol.h"
 
 namespace kivi {
 
-class MockKivNSAlert : public Object, public KivNSAlertProtocol {
+class KIVI_EXPORT MockKivNSAlert : public Object, public KivNSAlertProtocol {
  public:
   MockKivNSAlert() = default;
 

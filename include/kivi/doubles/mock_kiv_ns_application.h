@@ -16,11 +16,12 @@
 #include <functional>
 #include <string>
 
+#include "kivi/export.h"
 #include "kivi/platform/kiv_ns_application_protocol.h"
 
 namespace kivi {
 
-class MockKivNSApplication : public Object, public KivNSApplicationProtocol {
+class KIVI_EXPORT MockKivNSApplication : public Object, public KivNSApplicationProtocol {
  public:
   MockKivNSApplication() = default;
 

@@ -23,10 +23,11 @@
 
 #include "kivi/base/object.h"
 #include "kivi/desktop/kiv_ns_bundle_protocol.h"
+#include "kivi/export.h"
 
 namespace kivi {
 
-class MockKivNSBundle : public Object, public KivNSBundleProtocol {
+class KIVI_EXPORT MockKivNSBundle : public Object, public KivNSBundleProtocol {
  public:
   MockKivNSBundle() = default;
 

@@ -20,10 +20,11 @@
 
 #include "kivi/base/object.h"
 #include "kivi/dispatch/kiv_ns_distribution_lock_protocol.h"
+#include "kivi/export.h"
 
 namespace kivi {
 
-class MockKivNSDistributedLock : public Object, public KivNSDistributionLockProtocol {
+class KIVI_EXPORT MockKivNSDistributedLock : public Object, public KivNSDistributionLockProtocol {
  public:
   MockKivNSDistributedLock() = default;
 

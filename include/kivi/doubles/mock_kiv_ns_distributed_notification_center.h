@@ -26,12 +26,14 @@
 #include <string>
 
 #include "kivi/doubles/mock_kiv_ns_notification_center.h"
+#include "kivi/export.h"
 #include "kivi/platform/kiv_ns_distributed_notification_center_protocol.h"
 
 namespace kivi {
 
-class MockKivNSDistributedNotificationCenter : public MockKivNSNotificationCenter,
-                                               public KivNSDistributedNotificationCenterProtocol {
+class KIVI_EXPORT MockKivNSDistributedNotificationCenter
+    : public MockKivNSNotificationCenter,
+      public KivNSDistributedNotificationCenterProtocol {
  public:
   MockKivNSDistributedNotificationCenter() = default;
 

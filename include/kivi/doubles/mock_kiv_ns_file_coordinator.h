@@ -20,11 +20,12 @@
 #include <string>
 #include <vector>
 
+#include "kivi/export.h"
 #include "kivi/platform/kiv_ns_file_coordinator_protocol.h"
 
 namespace kivi {
 
-class MockKivNSFileCoordinator : public Object, public KivNSFileCoordinatorProtocol {
+class KIVI_EXPORT MockKivNSFileCoordinator : public Object, public KivNSFileCoordinatorProtocol {
  public:
   MockKivNSFileCoordinator() = default;
 

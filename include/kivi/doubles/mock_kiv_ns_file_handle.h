@@ -17,11 +17,12 @@
 #include <functional>
 
 #include "kivi/base/object.h"
+#include "kivi/export.h"
 #include "kivi/platform/kiv_ns_file_handle_protocol.h"
 
 namespace kivi {
 
-class MockKivNSFileHandle : public Object, public KivNSFileHandleProtocol {
+class KIVI_EXPORT MockKivNSFileHandle : public Object, public KivNSFileHandleProtocol {
  public:
   MockKivNSFileHandle() = default;
 

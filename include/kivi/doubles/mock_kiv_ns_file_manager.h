@@ -23,11 +23,12 @@
 #include <vector>
 
 #include "kivi/base/object.h"
+#include "kivi/export.h"
 #include "kivi/platform/kiv_ns_file_manager_protocol.h"
 
 namespace kivi {
 
-class MockKivNSFileManager : public Object, public KivNSFileManagerProtocol {
+class KIVI_EXPORT MockKivNSFileManager : public Object, public KivNSFileManagerProtocol {
  public:
   MockKivNSFileManager() = default;
 

@@ -22,11 +22,13 @@
 #include <string>
 #include <vector>
 
+#include "kivi/export.h"
 #include "kivi/platform/kiv_ns_http_cookie_storage_protocol.h"
 
 namespace kivi {
 
-class MockKivNSHTTPCookieStorage : public Object, public KivNSHTTPCookieStorageProtocol {
+class KIVI_EXPORT MockKivNSHTTPCookieStorage : public Object,
+                                               public KivNSHTTPCookieStorageProtocol {
  public:
   MockKivNSHTTPCookieStorage() = default;
 

@@ -20,11 +20,12 @@
 #include <memory>
 #include <string>
 
+#include "kivi/export.h"
 #include "kivi/platform/kiv_ns_item_provider_protocol.h"
 
 namespace kivi {
 
-class MockKivNSItemProvider : public Object, public KivNSItemProviderProtocol {
+class KIVI_EXPORT MockKivNSItemProvider : public Object, public KivNSItemProviderProtocol {
  public:
   MockKivNSItemProvider() = default;
 

@@ -21,11 +21,13 @@
 #include <memory>
 #include <string>
 
+#include "kivi/export.h"
 #include "kivi/platform/kiv_ns_notification_center_protocol.h"
 
 namespace kivi {
 
-class MockKivNSNotificationCenter : public Object, public KivNSNotificationCenterProtocol {
+class KIVI_EXPORT MockKivNSNotificationCenter : public Object,
+                                                public KivNSNotificationCenterProtocol {
  public:
   MockKivNSNotificationCenter() = default;
 

@@ -17,11 +17,12 @@
 #include <vector>
 
 #include "kivi/doubles/mock_kiv_ns_save_panel.h"
+#include "kivi/export.h"
 #include "kivi/platform/kiv_ns_open_panel_protocol.h"
 
 namespace kivi {
 
-class MockKivNSOpenPanel : public MockKivNSSavePanel, public KivNSOpenPanelProtocol {
+class KIVI_EXPORT MockKivNSOpenPanel : public MockKivNSSavePanel, public KivNSOpenPanelProtocol {
  public:
   MockKivNSOpenPanel() = default;
 

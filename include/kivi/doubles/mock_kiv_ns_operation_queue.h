@@ -21,10 +21,11 @@
 
 #include "kivi/base/object.h"
 #include "kivi/dispatch/operation_queue_protocol.h"
+#include "kivi/export.h"
 
 namespace kivi {
 
-class MockKivNSOperationQueue : public Object, public OperationQueueProtocol {
+class KIVI_EXPORT MockKivNSOperationQueue : public Object, public OperationQueueProtocol {
  public:
   MockKivNSOperationQueue() = default;
 

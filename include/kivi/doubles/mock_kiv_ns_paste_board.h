@@ -19,11 +19,12 @@
 #include <functional>
 #include <string>
 
+#include "kivi/export.h"
 #include "kivi/platform/kiv_ns_paste_board_protocol.h"
 
 namespace kivi {
 
-class MockKivNSPasteBoard : public Object, public KivNSPasteBoardProtocol {
+class KIVI_EXPORT MockKivNSPasteBoard : public Object, public KivNSPasteBoardProtocol {
  public:
   MockKivNSPasteBoard() = default;
 

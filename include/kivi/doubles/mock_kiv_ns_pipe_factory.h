@@ -14,11 +14,12 @@
 #include <functional>
 #include <memory>
 
+#include "kivi/export.h"
 #include "kivi/process/kiv_ns_process_factory.h"
 
 namespace kivi {
 
-class MockKivNSPipeFactory : public Object, public KivNSPipeFactoryProtocol {
+class KIVI_EXPORT MockKivNSPipeFactory : public Object, public KivNSPipeFactoryProtocol {
  public:
   MockKivNSPipeFactory() = default;
 

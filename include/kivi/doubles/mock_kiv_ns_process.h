@@ -28,11 +28,12 @@
 #include <string>
 #include <vector>
 
+#include "kivi/export.h"
 #include "kivi/process/kiv_ns_process_protocol.h"
 
 namespace kivi {
 
-class MockKivNSProcess : public Object, public KivNSProcessProtocol {
+class KIVI_EXPORT MockKivNSProcess : public Object, public KivNSProcessProtocol {
  public:
   MockKivNSProcess() = default;
 

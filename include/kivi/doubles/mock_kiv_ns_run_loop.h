@@ -16,10 +16,11 @@
 #include <vector>
 
 #include "kivi/dispatch/kiv_ns_run_loop_protocol.h"
+#include "kivi/export.h"
 
 namespace kivi {
 
-class MockKivNSRunLoop : public KivNSRunLoopProtocol {
+class KIVI_EXPORT MockKivNSRunLoop : public KivNSRunLoopProtocol {
  public:
   std::function<void()> runBlock;
   std::function<void(Date)> runUntilLimitDateBlock;

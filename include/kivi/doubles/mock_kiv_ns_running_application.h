@@ -23,11 +23,13 @@
 #include <vector>
 
 #include "kivi/base/object.h"
+#include "kivi/export.h"
 #include "kivi/process/kiv_ns_running_application_protocol.h"
 
 namespace kivi {
 
-class MockKivNSRunningApplication : public Object, public KivNSRunningApplicationProtocol {
+class KIVI_EXPORT MockKivNSRunningApplication : public Object,
+                                                public KivNSRunningApplicationProtocol {
  public:
   MockKivNSRunningApplication() = default;
 

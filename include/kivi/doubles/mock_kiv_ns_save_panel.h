@@ -20,11 +20,12 @@
 #include <optional>
 #include <string>
 
+#include "kivi/export.h"
 #include "kivi/platform/kiv_ns_save_panel_protocol.h"
 
 namespace kivi {
 
-class MockKivNSSavePanel : public Object, public virtual KivNSSavePanelProtocol {
+class KIVI_EXPORT MockKivNSSavePanel : public Object, public virtual KivNSSavePanelProtocol {
  public:
   MockKivNSSavePanel() = default;
 

@@ -17,11 +17,12 @@
 #include <string>
 #include <vector>
 
+#include "kivi/export.h"
 #include "kivi/platform/kiv_ns_sharing_service_protocol.h"
 
 namespace kivi {
 
-class MockKivNSSharingService : public Object, public KivNSSharingServiceProtocol {
+class KIVI_EXPORT MockKivNSSharingService : public Object, public KivNSSharingServiceProtocol {
  public:
   MockKivNSSharingService() = default;
 

@@ -19,11 +19,12 @@
 #include <string>
 
 #include "kivi/base/object.h"
+#include "kivi/export.h"
 #include "kivi/platform/kiv_ns_string_protocol.h"
 
 namespace kivi {
 
-class MockKivNSString : public Object, public KivNSStringProtocol {
+class KIVI_EXPORT MockKivNSString : public Object, public KivNSStringProtocol {
  public:
   MockKivNSString() = default;
 

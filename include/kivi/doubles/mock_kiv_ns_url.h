@@ -30,11 +30,12 @@
 #include <vector>
 
 #include "kivi/base/object.h"
+#include "kivi/export.h"
 #include "kivi/net/kiv_ns_url_protocol.h"
 
 namespace kivi {
 
-class MockKivNSURL : public Object, public KivNSURLProtocol {
+class KIVI_EXPORT MockKivNSURL : public Object, public KivNSURLProtocol {
  public:
   MockKivNSURL() = default;
 

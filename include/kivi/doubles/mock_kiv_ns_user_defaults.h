@@ -20,11 +20,12 @@
 #include <vector>
 
 #include "kivi/base/object.h"
+#include "kivi/export.h"
 #include "kivi/platform/kiv_ns_user_defaults_protocol.h"
 
 namespace kivi {
 
-class MockKivNSUserDefaults : public Object, public KivNSUserDefaultsProtocol {
+class KIVI_EXPORT MockKivNSUserDefaults : public Object, public KivNSUserDefaultsProtocol {
  public:
   MockKivNSUserDefaults() = default;
 

@@ -19,11 +19,12 @@
 #include <memory>
 #include <string>
 
+#include "kivi/export.h"
 #include "kivi/platform/kiv_ns_window_protocol.h"
 
 namespace kivi {
 
-class MockKivNSWindow : public Object, public KivNSWindowProtocol {
+class KIVI_EXPORT MockKivNSWindow : public Object, public KivNSWindowProtocol {
  public:
   MockKivNSWindow() = default;
 

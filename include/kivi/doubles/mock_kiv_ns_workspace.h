@@ -24,10 +24,11 @@
 
 #include "kivi/base/object.h"
 #include "kivi/desktop/kiv_ns_workspace_protocol.h"
+#include "kivi/export.h"
 
 namespace kivi {
 
-class MockKivNSWorkspace : public Object, public KivNSWorkspaceProtocol {
+class KIVI_EXPORT MockKivNSWorkspace : public Object, public KivNSWorkspaceProtocol {
  public:
   MockKivNSWorkspace() = default;
 

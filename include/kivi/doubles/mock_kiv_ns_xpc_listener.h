@@ -26,11 +26,12 @@
 #include <memory>
 
 #include "kivi/base/object.h"
+#include "kivi/export.h"
 #include "kivi/platform/ns_xpc.h"
 
 namespace kivi {
 
-class MockKivNSXPCListener : public Object, public NSXPCListenerDelegate {
+class KIVI_EXPORT MockKivNSXPCListener : public Object, public NSXPCListenerDelegate {
  public:
   MockKivNSXPCListener(std::shared_ptr<NSXPCInterface> interface, ObjectPtr exportedObject);
   ~MockKivNSXPCListener() override;

@@ -17,11 +17,12 @@
 #include <memory>
 
 #include "kivi/doubles/mock_kiv_ns_process.h"
+#include "kivi/export.h"
 #include "kivi/process/kiv_ns_process_factory.h"
 
 namespace kivi {
 
-class MockKivProcessFactory : public Object, public KivNSProcessFactoryProtocol {
+class KIVI_EXPORT MockKivProcessFactory : public Object, public KivNSProcessFactoryProtocol {
  public:
   MockKivProcessFactory() = default;
 

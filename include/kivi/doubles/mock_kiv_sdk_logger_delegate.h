@@ -23,11 +23,12 @@
 #include <string_view>
 
 #include "kivi/base/object.h"
+#include "kivi/export.h"
 #include "kivi/logging/kiv_sdk_logger_delegate.h"
 
 namespace kivi {
 
-class MockKivSDKLoggerDelegate : public Object, public KivSdkLoggerDelegate {
+class KIVI_EXPORT MockKivSDKLoggerDelegate : public Object, public KivSdkLoggerDelegate {
  public:
   using LogBlock = std::function<void(std::string_view module, std::string_view fileName,
                                       std::string_view functionName, std::uint64_t lineNumber,

@@ -18,11 +18,12 @@
 #include <string>
 
 #include "kivi/base/object.h"
+#include "kivi/export.h"
 #include "kivi/timing/kiv_timer_protocol.h"
 
 namespace kivi {
 
-class MockKivTimer : public Object, public KivTimerProtocol {
+class KIVI_EXPORT MockKivTimer : public Object, public KivTimerProtocol {
  public:
   MockKivTimer() = default;
 

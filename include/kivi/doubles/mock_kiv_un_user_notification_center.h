@@ -24,10 +24,12 @@
 
 #include "kivi/base/object.h"
 #include "kivi/desktop/kiv_un_user_notification_center_protocol.h"
+#include "kivi/export.h"
 
 namespace kivi {
 
-class MockKivUNUserNotificationCenter : public Object, public KivUNUserNotificationCenterProtocol {
+class KIVI_EXPORT MockKivUNUserNotificationCenter : public Object,
+                                                    public KivUNUserNotificationCenterProtocol {
  public:
   MockKivUNUserNotificationCenter() = default;
 

@@ -19,11 +19,12 @@
 #include <string>
 #include <vector>
 
+#include "kivi/export.h"
 #include "kivi/platform/kiv_wk_http_cookie_store_protocol.h"
 
 namespace kivi {
 
-class MockKivWKHTTPCookieStore : public Object, public KivWKHTTPCookieStoreProtocol {
+class KIVI_EXPORT MockKivWKHTTPCookieStore : public Object, public KivWKHTTPCookieStoreProtocol {
  public:
   MockKivWKHTTPCookieStore() = default;
 

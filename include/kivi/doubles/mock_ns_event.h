@@ -23,11 +23,12 @@
 
 #include <functional>
 
+#include "kivi/export.h"
 #include "kivi/platform/kiv_ns_event_protocol.h"
 
 namespace kivi {
 
-class MockNSEvent : public Object, public KivNSEventProtocol {
+class KIVI_EXPORT MockNSEvent : public Object, public KivNSEventProtocol {
  public:
   MockNSEvent() = default;
 

@@ -19,11 +19,12 @@
 #include <string>
 #include <vector>
 
+#include "kivi/export.h"
 #include "kivi/platform/kiv_ns_task_protocol.h"
 
 namespace kivi {
 
-class MockNSTask : public Object, public KivNSTaskProtocol {
+class KIVI_EXPORT MockNSTask : public Object, public KivNSTaskProtocol {
  public:
   MockNSTask() = default;
   explicit MockNSTask(std::int32_t terminationStatus) : terminationStatus_(terminationStatus) {}

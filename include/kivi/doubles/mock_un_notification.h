@@ -12,11 +12,12 @@
 
 #include <string>
 
+#include "kivi/export.h"
 #include "kivi/platform/kiv_un_notification_protocol.h"
 
 namespace kivi {
 
-class MockUNNotification : public Object, public KivUNNotificationProtocol {
+class KIVI_EXPORT MockUNNotification : public Object, public KivUNNotificationProtocol {
  public:
   MockUNNotification() = default;
 

@@ -12,11 +12,13 @@
 #include <memory>
 #include <string>
 
+#include "kivi/export.h"
 #include "kivi/platform/kiv_un_notification_response_protocol.h"
 
 namespace kivi {
 
-class MockUNNotificationResponse : public Object, public virtual KivUNNotificationResponseProtocol {
+class KIVI_EXPORT MockUNNotificationResponse : public Object,
+                                               public virtual KivUNNotificationResponseProtocol {
  public:
   MockUNNotificationResponse() = default;
 

@@ -14,12 +14,14 @@
 #include <string>
 
 #include "kivi/doubles/mock_un_notification_response.h"
+#include "kivi/export.h"
 #include "kivi/platform/kiv_un_text_input_notification_response_protocol.h"
 
 namespace kivi {
 
-class MockUNTextInputNotificationResponse : public MockUNNotificationResponse,
-                                            public KivUNTextInputNotificationResponseProtocol {
+class KIVI_EXPORT MockUNTextInputNotificationResponse
+    : public MockUNNotificationResponse,
+      public KivUNTextInputNotificationResponseProtocol {
  public:
   MockUNTextInputNotificationResponse() = default;
 

@@ -49,10 +49,11 @@
 #include <vector>
 
 #include "kivi/base/error.h"
+#include "kivi/export.h"
 
 namespace kivi {
 
-class KivUloFileParser {
+class KIVI_EXPORT KivUloFileParser {
  public:
   // The step budget of a regular-expression lookup, in RegularExpression's
   // steps of 0.2 to 1 ms: kBaseSteps, plus kStepsPerKilobyte for each KiB of
@@ -90,17 +91,18 @@ namespace detail {
 
 // Whether `key` is made only of ASCII letters, digits, "_" and "-" (the empty
 // name included), so that its pattern has no special characters.
-bool isPlainUloKey(std::string_view key);
+KIVI_EXPORT bool isPlainUloKey(std::string_view key);
 
 // The lookup through the regular-expression engine, for any name, with
 // `stepLimit` steps (none: KivUloFileParser::stepBudget(text); 0: no limit);
 // *error as for getValue().
-std::optional<std::string> uloValueByPattern(std::string_view text, std::string_view key,
-                                             ErrorPtr* error = nullptr,
-                                             std::optional<std::int32_t> stepLimit = std::nullopt);
+KIVI_EXPORT std::optional<std::string> uloValueByPattern(
+    std::string_view text, std::string_view key, ErrorPtr* error = nullptr,
+    std::optional<std::int32_t> stepLimit = std::nullopt);
 
 // The same lookup as a plain search; `key` must be plain.
-std::optional<std::string> uloValueByPlainSearch(std::string_view text, std::string_view key);
+KIVI_EXPORT std::optional<std::string> uloValueByPlainSearch(std::string_view text,
+                                                             std::string_view key);
 
 }  // namespace detail
 

@@ -12,9 +12,11 @@
 
 #include <string>
 
+#include "kivi/export.h"
+
 namespace kivi {
 
-class TEVAppLaunchConstants {
+class KIVI_EXPORT TEVAppLaunchConstants {
  public:
   TEVAppLaunchConstants() = default;
 

@@ -22,9 +22,11 @@
 #include <optional>
 #include <string>
 
+#include "kivi/export.h"
+
 namespace kivi {
 
-class KivObfuscator {
+class KIVI_EXPORT KivObfuscator {
  public:
   KivObfuscator() = delete;
 

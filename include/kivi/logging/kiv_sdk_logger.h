@@ -45,6 +45,7 @@
 #include <string_view>
 
 #include "kivi/base/object.h"
+#include "kivi/export.h"
 #include "kivi/logging/kiv_sdk_logger_delegate.h"
 #include "kivi/text/format.h"
 
@@ -53,7 +54,7 @@ namespace kivi {
 // A string argument that may be absent: made from text (std::string,
 // std::string_view, a C string) or from nullptr, std::nullopt or a null C
 // string, which are absent. An empty string is present.
-class KivSdkNullableString {
+class KIVI_EXPORT KivSdkNullableString {
  public:
   constexpr KivSdkNullableString() noexcept = default;
   constexpr KivSdkNullableString(std::nullptr_t) noexcept {}
@@ -78,7 +79,7 @@ class KivSdkNullableString {
   std::size_t size_ = 0;
 };
 
-class KivSdkLogger : public Object {
+class KIVI_EXPORT KivSdkLogger : public Object {
  public:
   // A logger holding `delegate` (may be null) weakly.
   static std::shared_ptr<KivSdkLogger> create(

@@ -39,6 +39,8 @@
 #include <cstdint>
 #include <string_view>
 
+#include "kivi/export.h"
+
 namespace kivi {
 
 // A log level. Only 1 to 6 have a meaning; every other value is accepted and
@@ -59,7 +61,7 @@ inline constexpr std::uint32_t KivSdkLoggerDelegateAotLogInfo = 1u << 3;
 inline constexpr std::uint32_t KivSdkLoggerDelegateGetMaxLogLevel = 1u << 4;
 inline constexpr std::uint32_t KivSdkLoggerDelegateAllAotLogs = 0x0f;
 
-class KivSdkLoggerDelegate {
+class KIVI_EXPORT KivSdkLoggerDelegate {
  public:
   virtual ~KivSdkLoggerDelegate() = default;
 

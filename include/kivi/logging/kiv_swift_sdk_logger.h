@@ -28,12 +28,13 @@
 #include <string>
 #include <string_view>
 
+#include "kivi/export.h"
 #include "kivi/logging/kiv_sdk_logger.h"
 #include "kivi/logging/kiv_sdk_logger_delegate.h"
 
 namespace kivi {
 
-class KivSwiftSdkLogger {
+class KIVI_EXPORT KivSwiftSdkLogger {
  public:
   // Creates the inner logger with `delegate` (may be null), then stores the
   // default module.

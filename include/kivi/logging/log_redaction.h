@@ -30,6 +30,7 @@
 #include <vector>
 
 #include "kivi/base/value.h"
+#include "kivi/export.h"
 #include "kivi/net/http_url_response.h"
 #include "kivi/net/url.h"
 #include "kivi/net/url_request.h"
@@ -43,11 +44,11 @@ using HeaderDictionaryPtr = std::shared_ptr<const StringDictionary>;
 // Parameters keep their order; a query without parameters is dropped with
 // its "?". Everything but query values (user, password, fragment included)
 // is kept. None for a null URL, and when the decoded text is not UTF-8.
-std::optional<std::string> KivSdkURLForLogging(const URLPtr& url);
+KIVI_EXPORT std::optional<std::string> KivSdkURLForLogging(const URLPtr& url);
 
 // "***" for a token with at least one character, "nil" for an empty or
 // absent one. Nothing of the token is kept, not even its length.
-std::string KivSdkTokenForLogging(const std::optional<std::string>& token);
+KIVI_EXPORT std::string KivSdkTokenForLogging(const std::optional<std::string>& token);
 inline std::string KivSdkTokenForLogging(std::nullptr_t) { return "nil"; }
 
 // A copy of `headers` in which the value under "Authorization" is masked
@@ -59,13 +60,13 @@ inline std::string KivSdkTokenForLogging(std::nullptr_t) { return "nil"; }
 // URLSession's answers spell names canonically; for dictionaries from
 // elsewhere, the allow-list form is the safe one.
 // A null or empty `headers` is returned itself (the very same pointer).
-HeaderDictionaryPtr KivSdkResponseHeadersForLogging(const HeaderDictionaryPtr& headers,
-                                                    const URLPtr& url);
+KIVI_EXPORT HeaderDictionaryPtr KivSdkResponseHeadersForLogging(const HeaderDictionaryPtr& headers,
+                                                                const URLPtr& url);
 // The same for a Value. One that is not a dictionary, or an empty one, comes
 // back as it is (sharing its dictionary). A "Set-Cookie" value that is not a
 // string is left as it is; an "Authorization" value of another kind becomes
 // "***", other values of any kind pass through.
-Value KivSdkResponseHeadersForLogging(const Value& headers, const URLPtr& url);
+KIVI_EXPORT Value KivSdkResponseHeadersForLogging(const Value& headers, const URLPtr& url);
 inline HeaderDictionaryPtr KivSdkResponseHeadersForLogging(std::nullptr_t, const URLPtr&) {
   return nullptr;
 }
@@ -75,15 +76,15 @@ inline HeaderDictionaryPtr KivSdkResponseHeadersForLogging(std::nullptr_t, const
 // version "1.0". Null for null. When the redacted URL cannot be made (see
 // KivSdkURLForLogging) or does not parse again (a user name holding a
 // decoded "@", say), `response` itself is returned, unredacted.
-HTTPURLResponsePtr KivSdkResponseForLogging(const HTTPURLResponsePtr& response);
+KIVI_EXPORT HTTPURLResponsePtr KivSdkResponseForLogging(const HTTPURLResponsePtr& response);
 
 // An allow-list: every entry of `headers` with its value when its name is
 // one of `keep` (exact match) and "***" otherwise, empty values included.
 // Empty for null or empty headers (and for a Value that is no dictionary).
-StringDictionary KivSdkObfuscateHeadersForLogging(const HeaderDictionaryPtr& headers,
-                                                  const std::vector<std::string>& keep);
-Dictionary KivSdkObfuscateHeadersForLogging(const Value& headers,
-                                            const std::vector<std::string>& keep);
+KIVI_EXPORT StringDictionary KivSdkObfuscateHeadersForLogging(const HeaderDictionaryPtr& headers,
+                                                              const std::vector<std::string>& keep);
+KIVI_EXPORT Dictionary KivSdkObfuscateHeadersForLogging(const Value& headers,
+                                                        const std::vector<std::string>& keep);
 inline StringDictionary KivSdkObfuscateHeadersForLogging(std::nullptr_t,
                                                          const std::vector<std::string>&) {
   return {};

@@ -19,6 +19,7 @@
 
 #include "kivi/base/object.h"
 #include "kivi/base/value.h"
+#include "kivi/export.h"
 #include "kivi/net/url.h"
 #include "kivi/net/url_request.h"
 
@@ -32,7 +33,7 @@ inline constexpr const char* HTTPCookieDomain = "NSHTTPCookieDomain";
 class HTTPCookie;
 using HTTPCookiePtr = std::shared_ptr<const HTTPCookie>;
 
-class HTTPCookie : public Object {
+class KIVI_EXPORT HTTPCookie : public Object {
  public:
   struct Properties {
     std::string name;

@@ -11,6 +11,7 @@
 #include <string_view>
 
 #include "kivi/base/object.h"
+#include "kivi/export.h"
 #include "kivi/net/url.h"
 #include "kivi/net/url_request.h"
 
@@ -19,7 +20,7 @@ namespace kivi {
 class HTTPURLResponse;
 using HTTPURLResponsePtr = std::shared_ptr<const HTTPURLResponse>;
 
-class HTTPURLResponse : public Object {
+class KIVI_EXPORT HTTPURLResponse : public Object {
  public:
   // `HTTPVersion` as sent on the status line ("HTTP/1.1", "HTTP/2"); header
   // fields whose names differ only in case are joined with ", ".

@@ -27,11 +27,10 @@
 
 #include "kivi/base/error.h"
 #include "kivi/base/value.h"
+#include "kivi/export.h"
 
 namespace kivi {
 
-// The platform's error domain for errno values.
-inline constexpr const char* POSIXErrorDomain = "NSPOSIXErrorDomain";
 // User-info key: the path of the file an error is about.
 inline constexpr const char* FilePathErrorKey = "NSFilePath";
 // User-info key: the URL of the file an error is about.
@@ -59,7 +58,7 @@ inline constexpr std::uint64_t URLBookmarkCreationWithSecurityScope = 1ULL << 11
 inline constexpr std::uint64_t URLBookmarkResolutionWithoutUI = 1ULL << 8;
 inline constexpr std::uint64_t URLBookmarkResolutionWithoutMounting = 1ULL << 9;
 
-class KivNSURLProtocol {
+class KIVI_EXPORT KivNSURLProtocol {
  public:
   virtual ~KivNSURLProtocol() = default;
 

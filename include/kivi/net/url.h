@@ -53,6 +53,7 @@
 #include <vector>
 
 #include "kivi/base/object.h"
+#include "kivi/export.h"
 #include "kivi/net/kiv_ns_url_protocol.h"
 
 namespace kivi {
@@ -60,7 +61,7 @@ namespace kivi {
 class URL;
 using URLPtr = std::shared_ptr<const URL>;
 
-class URL : public Object, public KivNSURLProtocol {
+class KIVI_EXPORT URL : public Object, public KivNSURLProtocol {
  public:
   static URLPtr URLWithString(std::string_view string, bool encodingInvalidCharacters = true);
   // "file://" plus `path` percent-encoded (every byte but unreserved

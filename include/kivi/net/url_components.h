@@ -27,17 +27,18 @@
 #include <string_view>
 #include <vector>
 
+#include "kivi/export.h"
 #include "kivi/net/url.h"
 
 namespace kivi {
 
-struct URLQueryItem {
+struct KIVI_EXPORT URLQueryItem {
   std::string name;
   std::optional<std::string> value;  // absent: a bare name without "="
   friend bool operator==(const URLQueryItem&, const URLQueryItem&) = default;
 };
 
-class URLComponents {
+class KIVI_EXPORT URLComponents {
  public:
   URLComponents() = default;
 
@@ -119,12 +120,12 @@ namespace percent_encoding {
 // Which bytes a component keeps as they are.
 enum class Component { user, password, host, path, query, fragment, queryItem };
 // Encodes every byte that `component` does not allow, as %XX.
-std::string encode(std::string_view text, Component component);
+KIVI_EXPORT std::string encode(std::string_view text, Component component);
 // Decodes %XX sequences (either case of hex digit); none when a "%" is not
 // followed by two hex digits or the decoded bytes are not UTF-8.
-std::optional<std::string> decode(std::string_view text);
+KIVI_EXPORT std::optional<std::string> decode(std::string_view text);
 // Whether `text` uses only bytes `component` allows and well-formed %XX.
-bool isValidlyEncoded(std::string_view text, Component component);
+KIVI_EXPORT bool isValidlyEncoded(std::string_view text, Component component);
 }  // namespace percent_encoding
 
 }  // namespace kivi

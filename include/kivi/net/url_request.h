@@ -26,6 +26,7 @@
 #include <vector>
 
 #include "kivi/base/value.h"
+#include "kivi/export.h"
 #include "kivi/net/url.h"
 
 namespace kivi {
@@ -36,9 +37,9 @@ using StringDictionary = std::map<std::string, std::string, std::less<>>;
 inline constexpr double URLRequestDefaultTimeoutInterval = 60.0;
 
 // Compares two header field names ignoring ASCII case.
-bool headerFieldNamesEqual(std::string_view a, std::string_view b) noexcept;
+KIVI_EXPORT bool headerFieldNamesEqual(std::string_view a, std::string_view b) noexcept;
 
-class URLRequest {
+class KIVI_EXPORT URLRequest {
  public:
   URLRequest() = default;
   explicit URLRequest(URLPtr url, double timeoutInterval = URLRequestDefaultTimeoutInterval)
@@ -57,7 +58,7 @@ class URLRequest {
     return fields_;
   }
 
-  friend bool operator==(const URLRequest&, const URLRequest&) noexcept;
+  friend KIVI_EXPORT bool operator==(const URLRequest&, const URLRequest&) noexcept;
 
  protected:
   URLPtr url_;
@@ -67,7 +68,7 @@ class URLRequest {
   std::vector<std::pair<std::string, std::string>> fields_;
 };
 
-class MutableURLRequest : public URLRequest {
+class KIVI_EXPORT MutableURLRequest : public URLRequest {
  public:
   using URLRequest::URLRequest;
   MutableURLRequest(const URLRequest& request) : URLRequest(request) {}

@@ -53,6 +53,7 @@
 #include "kivi/base/error.h"
 #include "kivi/base/object.h"
 #include "kivi/dispatch/operation_queue.h"
+#include "kivi/export.h"
 #include "kivi/net/http_url_response.h"
 #include "kivi/net/url_request.h"
 
@@ -84,7 +85,7 @@ inline constexpr std::int64_t URLErrorServerCertificateUntrusted = -1202;
 inline constexpr std::int64_t URLErrorClientCertificateRejected = -1205;
 inline constexpr std::int64_t URLErrorCannotLoadFromNetwork = -2000;
 
-struct URLSessionConfiguration {
+struct KIVI_EXPORT URLSessionConfiguration {
   static URLSessionConfiguration defaultSessionConfiguration() { return {}; }
   static URLSessionConfiguration ephemeralSessionConfiguration() { return {}; }
 
@@ -104,7 +105,7 @@ struct URLSessionConfiguration {
   std::size_t maximumResponseBodyBytes = 256 * 1024 * 1024;
 };
 
-class URLSessionTask : public Object {
+class KIVI_EXPORT URLSessionTask : public Object {
  public:
   enum class State : std::int64_t { running = 0, suspended = 1, canceling = 2, completed = 3 };
 
@@ -140,7 +141,7 @@ class URLSessionTask : public Object {
   const std::unique_ptr<Impl> impl_;
 };
 
-class URLSessionDataTask : public URLSessionTask {
+class KIVI_EXPORT URLSessionDataTask : public URLSessionTask {
  public:
   std::string className() const override { return "NSURLSessionDataTask"; }
 
@@ -152,7 +153,7 @@ class URLSessionDataTask : public URLSessionTask {
 using URLSessionTaskPtr = std::shared_ptr<URLSessionTask>;
 using URLSessionDataTaskPtr = std::shared_ptr<URLSessionDataTask>;
 
-class URLSession : public Object {
+class KIVI_EXPORT URLSession : public Object {
  public:
   // Data: the body received (possibly empty); none when the task failed.
   using DataTaskCompletionHandler =

@@ -51,10 +51,11 @@
 
 #include "kivi/base/error.h"
 #include "kivi/dispatch/operation.h"
+#include "kivi/export.h"
 
 namespace kivi {
 
-class KivAsyncOperationObjC : public Operation {
+class KIVI_EXPORT KivAsyncOperationObjC : public Operation {
  public:
   KivAsyncOperationObjC() = default;
 
@@ -86,7 +87,7 @@ class KivAsyncOperationObjC : public Operation {
   ErrorPtr completionError_;
 };
 
-class KivAsyncOperation : public Operation {
+class KIVI_EXPORT KivAsyncOperation : public Operation {
  public:
   enum class State : std::uint8_t { ready, executing, finished };
 

@@ -52,10 +52,11 @@
 #include "kivi/base/recursive_lock.h"
 #include "kivi/dispatch/operation.h"
 #include "kivi/dispatch/operation_queue_protocol.h"
+#include "kivi/export.h"
 
 namespace kivi {
 
-class KivAsyncServiceObjC : public Object {
+class KIVI_EXPORT KivAsyncServiceObjC : public Object {
  public:
   // A queue named `name` with a concurrency limit of 1.
   explicit KivAsyncServiceObjC(std::string operationQueueName);
@@ -73,7 +74,7 @@ class KivAsyncServiceObjC : public Object {
   std::shared_ptr<OperationQueueProtocol> operationQueue_;
 };
 
-class KivAsyncService {
+class KIVI_EXPORT KivAsyncService {
  public:
   KivAsyncService(std::string operationQueueName, std::int64_t maxConcurrentOperationCount);
   virtual ~KivAsyncService() = default;
@@ -87,7 +88,7 @@ class KivAsyncService {
 
 using PendingOperationList = std::deque<OperationPtr>;
 
-class KivAtomicWorkflowService : public KivAsyncServiceObjC {
+class KIVI_EXPORT KivAtomicWorkflowService : public KivAsyncServiceObjC {
  public:
   // Always serial: the queue's limit is 1. This is the service's only
   // constructor, so every service has its lock and its pending list.

@@ -17,12 +17,13 @@
 //     void processHTTPUrlResponse(kivi::HTTPURLResponsePtr response,
 //                                 const std::optional<kivi::Data>& data) override {
 //       kivi::ErrorPtr error;
-//       auto json = kivi::JSONSerialization::JSONObjectWithData(data.value_or(kivi::Data{}), 0,
-//       &error); if (response->statusCode() == 200 && json) profile = *json;
-//       completeOperationWithStatus(json ? kivi::KivJSONAPIOperationCompletionStatusSuccess
-//                                        :
-//                                        kivi::KivJSONAPIOperationCompletionStatusInvalidServerResponse,
-//                                   error);
+//       auto json = kivi::JSONSerialization::JSONObjectWithData(
+//           data.value_or(kivi::Data{}), 0, &error);
+//       if (response->statusCode() == 200 && json) profile = *json;
+//       completeOperationWithStatus(
+//           json ? kivi::KivJSONAPIOperationCompletionStatusSuccess
+//                : kivi::KivJSONAPIOperationCompletionStatusInvalidServerResponse,
+//           error);
 //     }
 //     kivi::Value profile;
 //   };
@@ -58,8 +59,9 @@
 #include <optional>
 #include <string>
 
-#include "kivi/text/json_serialization.h"
+#include "kivi/export.h"
 #include "kivi/operations/kiv_url_session_task_operation.h"
+#include "kivi/text/json_serialization.h"
 
 namespace kivi {
 
@@ -82,7 +84,7 @@ inline constexpr std::int64_t KivJSONAPIInvalidContentTypeError = 2;
 inline constexpr double DefaultJSONAPITimeout = 30.0;
 inline constexpr const char* ResponseHeadersKeyName = "Response headers";
 
-class KivJSONAPIOperation : public KivUrlSessionTaskOperationObjC {
+class KIVI_EXPORT KivJSONAPIOperation : public KivUrlSessionTaskOperationObjC {
  public:
   // initWithRestApiURL:urlSession:. The URL is not checked here: a null URL
   // ends in InvalidInput when the operation starts.

@@ -24,6 +24,7 @@
 #include <mutex>
 #include <optional>
 
+#include "kivi/export.h"
 #include "kivi/net/http_url_response.h"
 #include "kivi/net/url_request.h"
 #include "kivi/net/url_session.h"
@@ -33,7 +34,7 @@ namespace kivi {
 
 namespace detail {
 // The request, response and task both variants keep, under one lock.
-class UrlSessionTaskFields {
+class KIVI_EXPORT UrlSessionTaskFields {
  public:
   std::optional<URLRequest> request() const;
   void setRequest(std::optional<URLRequest> request);
@@ -50,7 +51,7 @@ class UrlSessionTaskFields {
 };
 }  // namespace detail
 
-class KivUrlSessionTaskOperationObjC : public KivAsyncOperationObjC {
+class KIVI_EXPORT KivUrlSessionTaskOperationObjC : public KivAsyncOperationObjC {
  public:
   // An operation without a session.
   KivUrlSessionTaskOperationObjC() = default;
@@ -76,7 +77,7 @@ class KivUrlSessionTaskOperationObjC : public KivAsyncOperationObjC {
   detail::UrlSessionTaskFields fields_;
 };
 
-class KivUrlSessionTaskOperation : public KivAsyncOperation {
+class KIVI_EXPORT KivUrlSessionTaskOperation : public KivAsyncOperation {
  public:
   // init(urlSession:)
   explicit KivUrlSessionTaskOperation(URLSessionPtr urlSession)

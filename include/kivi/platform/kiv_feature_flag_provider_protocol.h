@@ -11,9 +11,11 @@
 
 #include <string>
 
+#include "kivi/export.h"
+
 namespace kivi {
 
-class KivFeatureFlagProviderProtocol {
+class KIVI_EXPORT KivFeatureFlagProviderProtocol {
  public:
   virtual ~KivFeatureFlagProviderProtocol() = default;
 

@@ -11,11 +11,12 @@
 // from any thread.
 #pragma once
 
+#include "kivi/export.h"
 #include "kivi/net/url_request.h"
 
 namespace kivi {
 
-class KivHttpHeaderProviderServiceProtocol {
+class KIVI_EXPORT KivHttpHeaderProviderServiceProtocol {
  public:
   virtual ~KivHttpHeaderProviderServiceProtocol() = default;
 

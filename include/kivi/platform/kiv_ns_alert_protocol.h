@@ -17,11 +17,12 @@
 #include <memory>
 #include <string>
 
+#include "kivi/export.h"
 #include "kivi/platform/platform_types.h"
 
 namespace kivi {
 
-class KivNSAlertProtocol {
+class KIVI_EXPORT KivNSAlertProtocol {
  public:
   virtual ~KivNSAlertProtocol() = default;
 

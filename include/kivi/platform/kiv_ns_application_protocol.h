@@ -12,10 +12,11 @@
 #pragma once
 
 #include "kivi/base/object.h"
+#include "kivi/export.h"
 
 namespace kivi {
 
-class KivNSApplicationProtocol {
+class KIVI_EXPORT KivNSApplicationProtocol {
  public:
   virtual ~KivNSApplicationProtocol() = default;
 

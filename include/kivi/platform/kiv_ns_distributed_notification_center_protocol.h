@@ -17,6 +17,7 @@
 #include <cstdint>
 #include <string>
 
+#include "kivi/export.h"
 #include "kivi/platform/kiv_ns_notification_center_protocol.h"
 
 namespace kivi {
@@ -35,7 +36,7 @@ using NSDistributedNotificationOptions = std::uint64_t;
 inline constexpr NSDistributedNotificationOptions NSDistributedNotificationDeliverImmediately = 1;
 inline constexpr NSDistributedNotificationOptions NSDistributedNotificationPostToAllSessions = 2;
 
-class KivNSDistributedNotificationCenterProtocol {
+class KIVI_EXPORT KivNSDistributedNotificationCenterProtocol {
  public:
   virtual ~KivNSDistributedNotificationCenterProtocol() = default;
 

@@ -18,6 +18,7 @@
 
 #include <functional>
 
+#include "kivi/export.h"
 #include "kivi/platform/platform_types.h"
 
 namespace kivi {
@@ -26,7 +27,7 @@ namespace kivi {
 // same one, another, or null to swallow it).
 using NSEventMonitorHandler = std::function<NSEventPtr(const NSEventPtr& event)>;
 
-class KivNSEventProtocol {
+class KIVI_EXPORT KivNSEventProtocol {
  public:
   virtual ~KivNSEventProtocol() = default;
 

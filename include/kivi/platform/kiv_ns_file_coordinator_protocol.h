@@ -24,6 +24,7 @@
 
 #include "kivi/base/error.h"
 #include "kivi/dispatch/operation_queue.h"
+#include "kivi/export.h"
 
 namespace kivi {
 
@@ -40,7 +41,7 @@ inline constexpr NSFileCoordinatorWritingOptions NSFileCoordinatorWritingForMerg
 inline constexpr NSFileCoordinatorWritingOptions NSFileCoordinatorWritingForReplacing = 1 << 3;
 
 // One file to read or write in coordinateAccessWithIntents().
-struct NSFileAccessIntent {
+struct KIVI_EXPORT NSFileAccessIntent {
   URLPtr url;
   bool writing = false;
   std::uint64_t options = 0;
@@ -55,7 +56,7 @@ struct NSFileAccessIntent {
   }
 };
 
-class KivNSFileCoordinatorProtocol {
+class KIVI_EXPORT KivNSFileCoordinatorProtocol {
  public:
   virtual ~KivNSFileCoordinatorProtocol() = default;
 

@@ -11,10 +11,11 @@
 #pragma once
 
 #include "kivi/base/value.h"
+#include "kivi/export.h"
 
 namespace kivi {
 
-class KivNSFileHandleProtocol {
+class KIVI_EXPORT KivNSFileHandleProtocol {
  public:
   virtual ~KivNSFileHandleProtocol() = default;
 

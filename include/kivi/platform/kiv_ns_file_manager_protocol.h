@@ -24,6 +24,7 @@
 
 #include "kivi/base/error.h"
 #include "kivi/base/value.h"
+#include "kivi/export.h"
 
 namespace kivi {
 
@@ -49,7 +50,7 @@ inline constexpr NSDirectoryEnumerationOptions NSDirectoryEnumerationSkipsSubdir
     1 << 0;
 inline constexpr NSDirectoryEnumerationOptions NSDirectoryEnumerationSkipsHiddenFiles = 1 << 2;
 
-class KivNSFileManagerProtocol {
+class KIVI_EXPORT KivNSFileManagerProtocol {
  public:
   virtual ~KivNSFileManagerProtocol() = default;
 

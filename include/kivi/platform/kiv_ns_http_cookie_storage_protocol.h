@@ -15,6 +15,7 @@
 #include <string>
 #include <vector>
 
+#include "kivi/export.h"
 #include "kivi/net/http_cookie.h"
 
 namespace kivi {
@@ -24,7 +25,7 @@ inline constexpr NSHTTPCookieAcceptPolicy NSHTTPCookieAcceptPolicyAlways = 0;
 inline constexpr NSHTTPCookieAcceptPolicy NSHTTPCookieAcceptPolicyNever = 1;
 inline constexpr NSHTTPCookieAcceptPolicy NSHTTPCookieAcceptPolicyOnlyFromMainDocumentDomain = 2;
 
-class KivNSHTTPCookieStorageProtocol {
+class KIVI_EXPORT KivNSHTTPCookieStorageProtocol {
  public:
   virtual ~KivNSHTTPCookieStorageProtocol() = default;
 

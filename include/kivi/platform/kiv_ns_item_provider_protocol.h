@@ -16,11 +16,12 @@
 #include <functional>
 #include <string>
 
+#include "kivi/export.h"
 #include "kivi/platform/platform_types.h"
 
 namespace kivi {
 
-class KivNSItemProviderProtocol {
+class KIVI_EXPORT KivNSItemProviderProtocol {
  public:
   virtual ~KivNSItemProviderProtocol() = default;
 

@@ -20,13 +20,14 @@
 #include <string>
 
 #include "kivi/dispatch/operation_queue.h"
+#include "kivi/export.h"
 #include "kivi/platform/platform_types.h"
 
 namespace kivi {
 
 using NSNotificationName = std::string;
 
-class KivNSNotificationCenterProtocol {
+class KIVI_EXPORT KivNSNotificationCenterProtocol {
  public:
   virtual ~KivNSNotificationCenterProtocol() = default;
 

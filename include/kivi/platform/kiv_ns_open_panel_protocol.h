@@ -17,11 +17,12 @@
 
 #include <vector>
 
+#include "kivi/export.h"
 #include "kivi/platform/kiv_ns_save_panel_protocol.h"
 
 namespace kivi {
 
-class KivNSOpenPanelProtocol : public virtual KivNSSavePanelProtocol {
+class KIVI_EXPORT KivNSOpenPanelProtocol : public virtual KivNSSavePanelProtocol {
  public:
   virtual bool canChooseFiles() const = 0;
   virtual void setCanChooseFiles(bool flag) = 0;

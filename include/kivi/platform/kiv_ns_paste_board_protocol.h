@@ -13,11 +13,12 @@
 #include <cstdint>
 #include <string>
 
+#include "kivi/export.h"
 #include "kivi/platform/platform_types.h"
 
 namespace kivi {
 
-class KivNSPasteBoardProtocol {
+class KIVI_EXPORT KivNSPasteBoardProtocol {
  public:
   virtual ~KivNSPasteBoardProtocol() = default;
 

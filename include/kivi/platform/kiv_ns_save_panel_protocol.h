@@ -22,6 +22,7 @@
 #include <optional>
 #include <string>
 
+#include "kivi/export.h"
 #include "kivi/platform/platform_types.h"
 
 namespace kivi {
@@ -29,7 +30,7 @@ namespace kivi {
 // Receives the panel's modal response (NSModalResponseOK or ...Cancel).
 using NSModalCompletionHandler = std::function<void(NSModalResponse response)>;
 
-class KivNSSavePanelProtocol {
+class KIVI_EXPORT KivNSSavePanelProtocol {
  public:
   virtual ~KivNSSavePanelProtocol() = default;
 

@@ -16,11 +16,12 @@
 #include <string>
 #include <vector>
 
+#include "kivi/export.h"
 #include "kivi/platform/platform_types.h"
 
 namespace kivi {
 
-class KivNSSharingServiceProtocol {
+class KIVI_EXPORT KivNSSharingServiceProtocol {
  public:
   virtual ~KivNSSharingServiceProtocol() = default;
 

@@ -14,6 +14,7 @@
 
 #include "kivi/base/error.h"
 #include "kivi/base/value.h"
+#include "kivi/export.h"
 
 namespace kivi {
 
@@ -24,7 +25,7 @@ inline constexpr NSStringEncoding NSUTF8StringEncoding = 4;
 inline constexpr NSStringEncoding NSISOLatin1StringEncoding = 5;
 inline constexpr NSStringEncoding NSUTF16StringEncoding = 10;
 
-class KivNSStringProtocol {
+class KIVI_EXPORT KivNSStringProtocol {
  public:
   virtual ~KivNSStringProtocol() = default;
 

@@ -20,10 +20,11 @@
 #include <vector>
 
 #include "kivi/base/object.h"
+#include "kivi/export.h"
 
 namespace kivi {
 
-class KivNSTaskProtocol {
+class KIVI_EXPORT KivNSTaskProtocol {
  public:
   virtual ~KivNSTaskProtocol() = default;
 

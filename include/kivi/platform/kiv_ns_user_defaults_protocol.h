@@ -20,10 +20,11 @@
 #include <vector>
 
 #include "kivi/base/value.h"
+#include "kivi/export.h"
 
 namespace kivi {
 
-class KivNSUserDefaultsProtocol {
+class KIVI_EXPORT KivNSUserDefaultsProtocol {
  public:
   virtual ~KivNSUserDefaultsProtocol() = default;
 

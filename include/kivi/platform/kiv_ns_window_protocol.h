@@ -13,11 +13,12 @@
 
 #include <memory>
 
+#include "kivi/export.h"
 #include "kivi/platform/platform_types.h"
 
 namespace kivi {
 
-class KivNSWindowProtocol {
+class KIVI_EXPORT KivNSWindowProtocol {
  public:
   virtual ~KivNSWindowProtocol() = default;
 

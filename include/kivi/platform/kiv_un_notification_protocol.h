@@ -16,10 +16,11 @@
 #include <string>
 
 #include "kivi/desktop/user_notifications.h"
+#include "kivi/export.h"
 
 namespace kivi {
 
-class KivUNNotificationProtocol {
+class KIVI_EXPORT KivUNNotificationProtocol {
  public:
   virtual ~KivUNNotificationProtocol() = default;
 

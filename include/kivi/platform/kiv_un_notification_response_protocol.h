@@ -19,10 +19,11 @@
 #include <string>
 
 #include "kivi/desktop/user_notifications.h"
+#include "kivi/export.h"
 
 namespace kivi {
 
-class KivUNNotificationResponseProtocol {
+class KIVI_EXPORT KivUNNotificationResponseProtocol {
  public:
   virtual ~KivUNNotificationResponseProtocol() = default;
 

@@ -13,11 +13,12 @@
 
 #include <string>
 
+#include "kivi/export.h"
 #include "kivi/platform/kiv_un_notification_response_protocol.h"
 
 namespace kivi {
 
-class KivUNTextInputNotificationResponseProtocol
+class KIVI_EXPORT KivUNTextInputNotificationResponseProtocol
     : public virtual KivUNNotificationResponseProtocol {
  public:
   virtual std::string userText() const = 0;

@@ -17,11 +17,12 @@
 #include <string>
 #include <vector>
 
+#include "kivi/export.h"
 #include "kivi/net/http_cookie.h"
 
 namespace kivi {
 
-class KivWKHTTPCookieStoreProtocol {
+class KIVI_EXPORT KivWKHTTPCookieStoreProtocol {
  public:
   virtual ~KivWKHTTPCookieStoreProtocol() = default;
 

@@ -47,6 +47,7 @@
 #include <string>
 
 #include "kivi/base/object.h"
+#include "kivi/export.h"
 
 namespace kivi {
 
@@ -55,7 +56,7 @@ class NSXPCListener;
 
 // A named protocol description: what a connection's exported or remote
 // object implements.
-class NSXPCInterface : public Object {
+class KIVI_EXPORT NSXPCInterface : public Object {
  public:
   explicit NSXPCInterface(std::string protocolName) : protocolName_(std::move(protocolName)) {}
   static std::shared_ptr<NSXPCInterface> interfaceWithProtocol(std::string protocolName) {
@@ -69,7 +70,7 @@ class NSXPCInterface : public Object {
 };
 
 // What a client connects to: names one listener (weakly).
-class NSXPCListenerEndpoint : public Object {
+class KIVI_EXPORT NSXPCListenerEndpoint : public Object {
  public:
   std::string className() const override { return "NSXPCListenerEndpoint"; }
 
@@ -89,7 +90,7 @@ class NSXPCListenerEndpoint : public Object {
 };
 
 // Decides about each new connection of a listener.
-class NSXPCListenerDelegate {
+class KIVI_EXPORT NSXPCListenerDelegate {
  public:
   virtual ~NSXPCListenerDelegate() = default;
   // True accepts `newConnection` (set up its exported interface and object
@@ -98,7 +99,7 @@ class NSXPCListenerDelegate {
                         const std::shared_ptr<NSXPCConnection>& newConnection) = 0;
 };
 
-class NSXPCListener : public Object {
+class KIVI_EXPORT NSXPCListener : public Object {
   struct Token {
     explicit Token() = default;
   };
@@ -130,7 +131,7 @@ class NSXPCListener : public Object {
   const std::unique_ptr<State> state_;
 };
 
-class NSXPCConnection : public Object {
+class KIVI_EXPORT NSXPCConnection : public Object {
   struct Token {
     explicit Token() = default;
   };

@@ -32,38 +32,39 @@
 #include "kivi/base/error.h"
 #include "kivi/base/object.h"
 #include "kivi/base/value.h"
+#include "kivi/export.h"
 
 namespace kivi {
 
 // A plain object with nothing but identity (an observer token, a sender).
-class NSObject : public Object {
+class KIVI_EXPORT NSObject : public Object {
  public:
   NSObject() = default;
   std::string className() const override { return "NSObject"; }
 };
 
 // Opaque user-interface handles.
-class NSWindow : public Object {
+class KIVI_EXPORT NSWindow : public Object {
  public:
   NSWindow() = default;
   std::string className() const override { return "NSWindow"; }
 };
-class NSView : public Object {
+class KIVI_EXPORT NSView : public Object {
  public:
   NSView() = default;
   std::string className() const override { return "NSView"; }
 };
-class NSViewController : public Object {
+class KIVI_EXPORT NSViewController : public Object {
  public:
   NSViewController() = default;
   std::string className() const override { return "NSViewController"; }
 };
-class NSImage : public Object {
+class KIVI_EXPORT NSImage : public Object {
  public:
   NSImage() = default;
   std::string className() const override { return "NSImage"; }
 };
-class NSButton : public Object {
+class KIVI_EXPORT NSButton : public Object {
  public:
   NSButton() = default;
   std::string className() const override { return "NSButton"; }
@@ -82,7 +83,7 @@ inline constexpr NSEventType NSEventTypeKeyUp = 11;
 inline constexpr NSEventType NSEventTypeFlagsChanged = 12;
 inline constexpr NSEventType NSEventTypeScrollWheel = 22;
 
-class NSEvent : public Object {
+class KIVI_EXPORT NSEvent : public Object {
  public:
   explicit NSEvent(NSEventType type = 0) : type_(type) {}
   NSEventType type() const noexcept { return type_; }
@@ -140,14 +141,14 @@ using NSSharingItems = std::vector<Value>;
 // the observed thing happens (a notification center passes the
 // NSNotification as the argument). A null invoke is a selector that does
 // nothing.
-struct Selector {
+struct KIVI_EXPORT Selector {
   std::string name;
   std::function<void(const ObjectPtr& target, const ObjectPtr& argument)> invoke;
 };
 
 // A notification: its name, the object it is about (null for none) and
 // extra information.
-class NSNotification : public Object {
+class KIVI_EXPORT NSNotification : public Object {
  public:
   NSNotification(std::string name, ObjectPtr object, Dictionary userInfo = {})
       : name_(std::move(name)), object_(std::move(object)), userInfo_(std::move(userInfo)) {}
@@ -165,7 +166,7 @@ using NSNotificationPtr = std::shared_ptr<const NSNotification>;
 
 // The progress of a piece of work, in units: done when completed reaches
 // total. A total of 0 (the start) means "not known yet".
-class NSProgress : public Object {
+class KIVI_EXPORT NSProgress : public Object {
  public:
   explicit NSProgress(std::int64_t totalUnitCount = 0) : total_(totalUnitCount) {}
   static std::shared_ptr<NSProgress> progressWithTotalUnitCount(std::int64_t count) {
@@ -185,7 +186,7 @@ using NSProgressPtr = std::shared_ptr<NSProgress>;
 
 // A save or open panel's delegate. Every method is optional; the defaults
 // let everything through.
-class NSOpenSavePanelDelegate {
+class KIVI_EXPORT NSOpenSavePanelDelegate {
  public:
   virtual ~NSOpenSavePanelDelegate() = default;
   // Whether the panel shows `url` as selectable.
@@ -201,7 +202,7 @@ class NSOpenSavePanelDelegate {
 };
 
 // An alert's delegate.
-class NSAlertDelegate {
+class KIVI_EXPORT NSAlertDelegate {
  public:
   virtual ~NSAlertDelegate() = default;
   // Called when the user asks for help; true when the delegate gave it.
@@ -209,7 +210,7 @@ class NSAlertDelegate {
 };
 
 // An object an item provider can make from an item's data.
-class NSItemProviderReading {
+class KIVI_EXPORT NSItemProviderReading {
  public:
   virtual ~NSItemProviderReading() = default;
 };
@@ -218,7 +219,7 @@ using NSItemProviderReadingPtr = std::shared_ptr<NSItemProviderReading>;
 // The class of such objects, as an item provider is handed it: its name,
 // the type identifiers it reads (in order of preference), and how an object
 // is made from data of one of them (null with `*error` set when it cannot).
-struct NSItemProviderReadingClass {
+struct KIVI_EXPORT NSItemProviderReadingClass {
   std::string className;
   std::vector<std::string> readableTypeIdentifiersForItemProvider;
   std::function<NSItemProviderReadingPtr(const Data& data, const std::string& typeIdentifier,

@@ -6,8 +6,11 @@
 //   std::shared_ptr<kivi::KivNSProcessFactoryProtocol> processes =
 //       std::make_shared<kivi::KivNSProcessFactory>();
 //   std::shared_ptr<kivi::KivNSPipeFactoryProtocol> pipes =
-//   std::make_shared<kivi::KivNSPipeFactory>(); auto task = processes->createProcess(); auto out =
-//   pipes->createPipe(); task->setLaunchPath("/bin/date"); task->setStandardOutput(out);
+//       std::make_shared<kivi::KivNSPipeFactory>();
+//   auto task = processes->createProcess();
+//   auto out = pipes->createPipe();
+//   task->setLaunchPath("/bin/date");
+//   task->setStandardOutput(out);
 //   task->launch();
 //   kivi::Data text = out->fileHandleForReading()->readDataToEndOfFile();
 //
@@ -21,24 +24,25 @@
 #include <memory>
 
 #include "kivi/base/object.h"
+#include "kivi/export.h"
 #include "kivi/process/kiv_ns_process_protocol.h"
 #include "kivi/process/ns_pipe.h"
 
 namespace kivi {
 
-class KivNSProcessFactoryProtocol {
+class KIVI_EXPORT KivNSProcessFactoryProtocol {
  public:
   virtual ~KivNSProcessFactoryProtocol() = default;
   virtual std::shared_ptr<KivNSProcessProtocol> createProcess() = 0;
 };
 
-class KivNSPipeFactoryProtocol {
+class KIVI_EXPORT KivNSPipeFactoryProtocol {
  public:
   virtual ~KivNSPipeFactoryProtocol() = default;
   virtual std::shared_ptr<NSPipe> createPipe() = 0;
 };
 
-class KivNSProcessFactory : public Object, public KivNSProcessFactoryProtocol {
+class KIVI_EXPORT KivNSProcessFactory : public Object, public KivNSProcessFactoryProtocol {
  public:
   KivNSProcessFactory() = default;
   // A new NSTask.
@@ -46,7 +50,7 @@ class KivNSProcessFactory : public Object, public KivNSProcessFactoryProtocol {
   std::string className() const override { return "KivNSProcessFactory"; }
 };
 
-class KivNSPipeFactory : public Object, public KivNSPipeFactoryProtocol {
+class KIVI_EXPORT KivNSPipeFactory : public Object, public KivNSPipeFactoryProtocol {
  public:
   KivNSPipeFactory() = default;
   // NSPipe::pipe().

@@ -30,6 +30,7 @@
 
 #include "kivi/base/error.h"
 #include "kivi/base/object.h"
+#include "kivi/export.h"
 #include "kivi/net/url.h"
 
 namespace kivi {
@@ -42,7 +43,7 @@ inline constexpr std::int64_t NSTaskTerminationReasonUncaughtSignal = 2;
 
 using NSTaskTerminationHandler = std::function<void(const std::shared_ptr<NSTask>&)>;
 
-class KivNSProcessProtocol {
+class KIVI_EXPORT KivNSProcessProtocol {
  public:
   virtual ~KivNSProcessProtocol() = default;
 

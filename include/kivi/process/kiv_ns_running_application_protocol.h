@@ -16,11 +16,13 @@
 #include <string>
 #include <vector>
 
+#include "kivi/export.h"
+
 namespace kivi {
 
 class NSRunningApplication;
 
-class KivNSRunningApplicationProtocol {
+class KIVI_EXPORT KivNSRunningApplicationProtocol {
  public:
   virtual ~KivNSRunningApplicationProtocol() = default;
 

@@ -51,6 +51,7 @@
 #include "kivi/base/error.h"
 #include "kivi/base/object.h"
 #include "kivi/base/value.h"
+#include "kivi/export.h"
 
 namespace kivi {
 
@@ -60,7 +61,7 @@ struct FileHandleState;
 }  // namespace detail
 using NSFileHandleReadabilityHandler = std::function<void(const std::shared_ptr<NSFileHandle>&)>;
 
-class NSFileHandle : public Object {
+class KIVI_EXPORT NSFileHandle : public Object {
  public:
   // A handle on `fd`; with closeOnDealloc the handle owns the descriptor and
   // closes it when destroyed. A negative descriptor gives a handle that is

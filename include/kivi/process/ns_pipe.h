@@ -21,11 +21,12 @@
 #include <string>
 
 #include "kivi/base/object.h"
+#include "kivi/export.h"
 #include "kivi/process/ns_file_handle.h"
 
 namespace kivi {
 
-class NSPipe : public Object {
+class KIVI_EXPORT NSPipe : public Object {
  public:
   static std::shared_ptr<NSPipe> pipe();
 

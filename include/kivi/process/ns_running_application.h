@@ -48,6 +48,7 @@
 
 #include "kivi/base/object.h"
 #include "kivi/base/value.h"
+#include "kivi/export.h"
 #include "kivi/net/url.h"
 #include "kivi/process/kiv_ns_running_application_protocol.h"
 
@@ -57,7 +58,7 @@ namespace detail {
 struct RunningApplicationSnapshot;
 }  // namespace detail
 
-class NSRunningApplication : public Object, public KivNSRunningApplicationProtocol {
+class KIVI_EXPORT NSRunningApplication : public Object, public KivNSRunningApplicationProtocol {
  public:
   // The object to hold for the type-level lookup.
   static std::shared_ptr<KivNSRunningApplicationProtocol> classObject();

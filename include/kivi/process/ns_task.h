@@ -81,6 +81,7 @@
 
 #include "kivi/base/error.h"
 #include "kivi/base/object.h"
+#include "kivi/export.h"
 #include "kivi/net/url.h"
 #include "kivi/process/kiv_ns_process_protocol.h"
 
@@ -88,7 +89,7 @@ namespace kivi {
 
 using NSTaskEnvironment = std::map<std::string, std::string>;
 
-class NSTask : public Object, public KivNSProcessProtocol {
+class KIVI_EXPORT NSTask : public Object, public KivNSProcessProtocol {
  public:
   // A new, unlaunched task with nothing set.
   static std::shared_ptr<NSTask> create();

@@ -74,6 +74,7 @@
 #include <string>
 
 #include "kivi/base/value.h"
+#include "kivi/export.h"
 #include "kivi/security/os_status.h"
 
 namespace kivi {
@@ -101,15 +102,15 @@ inline constexpr const char* kSecMatchLimitAll = "m_LimitAll";
 
 // Finds items; `result` (may be null) receives what the query's r_ keys ask
 // for, and is left alone on failure.
-OSStatus SecItemCopyMatching(const Dictionary& query, Value* result);
+KIVI_EXPORT OSStatus SecItemCopyMatching(const Dictionary& query, Value* result);
 // Adds an item; `result` (may be null) receives what the r_ keys ask for.
-OSStatus SecItemAdd(const Dictionary& attributes, Value* result);
+KIVI_EXPORT OSStatus SecItemAdd(const Dictionary& attributes, Value* result);
 // Deletes the items the query matches.
-OSStatus SecItemDelete(const Dictionary& query);
+KIVI_EXPORT OSStatus SecItemDelete(const Dictionary& query);
 
 // The access group this application's items get when none is given (see
 // "Access groups" above). Computed once per process.
-std::string SecDefaultAccessGroup();
+KIVI_EXPORT std::string SecDefaultAccessGroup();
 
 // The keychain's lock, shared by every thread and every process of the user:
 // while one SecItemTransaction is alive, no other thread or process adds an
@@ -129,7 +130,7 @@ std::string SecDefaultAccessGroup();
 //
 // Thread contract: a transaction belongs to the thread that made it and is
 // destroyed on that thread.
-class SecItemTransaction {
+class KIVI_EXPORT SecItemTransaction {
  public:
   SecItemTransaction();
   ~SecItemTransaction();

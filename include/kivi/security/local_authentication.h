@@ -30,6 +30,7 @@
 
 #include "kivi/base/error.h"
 #include "kivi/base/object.h"
+#include "kivi/export.h"
 
 namespace kivi {
 
@@ -62,7 +63,7 @@ enum LAError : std::int64_t {
   LAErrorNotInteractive = -1004,
 };
 
-class LAContext : public Object {
+class KIVI_EXPORT LAContext : public Object {
  public:
   LAContext();
   virtual ~LAContext();
@@ -93,6 +94,6 @@ class LAContext : public Object {
 // when not empty, else $DBUS_SYSTEM_BUS_ADDRESS, else
 // "unix:path=/run/dbus/system_bus_socket". An empty string restores that
 // default. Affects calls that start afterwards.
-void LASetSystemBusAddressForTesting(std::string address);
+KIVI_EXPORT void LASetSystemBusAddressForTesting(std::string address);
 
 }  // namespace kivi

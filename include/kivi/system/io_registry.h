@@ -39,6 +39,7 @@
 #include <cstdint>
 
 #include "kivi/base/value.h"
+#include "kivi/export.h"
 #include "kivi/system/mach.h"
 
 namespace kivi {
@@ -52,15 +53,15 @@ inline constexpr mach_port_t kIOMasterPortDefault = 0;
 inline constexpr mach_port_t kIOMainPortDefault = 0;
 
 // {"IOProviderClass": name}; a null name gives an empty Dictionary.
-Dictionary IOServiceMatching(const char* name);
+KIVI_EXPORT Dictionary IOServiceMatching(const char* name);
 // A new handle on the first service whose class is the dictionary's
 // "IOProviderClass"; 0 when nothing matches or mainPort is not the default.
-io_service_t IOServiceGetMatchingService(mach_port_t mainPort, Dictionary matching);
+KIVI_EXPORT io_service_t IOServiceGetMatchingService(mach_port_t mainPort, Dictionary matching);
 // The property `key` of `entry`; a null Value when absent or when `entry` is
 // not a live handle. `allocator` and `options` are accepted and unused.
-Value IORegistryEntryCreateCFProperty(io_registry_entry_t entry, const String& key,
-                                      const void* allocator, IOOptionBits options);
+KIVI_EXPORT Value IORegistryEntryCreateCFProperty(io_registry_entry_t entry, const String& key,
+                                                  const void* allocator, IOOptionBits options);
 // Gives a handle back; KERN_INVALID_ARGUMENT for one that is not live.
-kern_return_t IOObjectRelease(io_object_t object);
+KIVI_EXPORT kern_return_t IOObjectRelease(io_object_t object);
 
 }  // namespace kivi

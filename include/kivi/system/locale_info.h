@@ -27,9 +27,11 @@
 #include <optional>
 #include <string>
 
+#include "kivi/export.h"
+
 namespace kivi {
 
-class Locale {
+class KIVI_EXPORT Locale {
  public:
   static std::shared_ptr<const Locale> currentLocale();
   // "de_DE", "en_US_POSIX", "fr".
@@ -45,7 +47,7 @@ class Locale {
   std::string identifier_;
 };
 
-class TimeZone {
+class KIVI_EXPORT TimeZone {
  public:
   static std::shared_ptr<const TimeZone> localTimeZone();
   // A zone by its IANA name; null unless the zoneinfo directory holds it

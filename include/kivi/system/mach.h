@@ -72,6 +72,8 @@
 
 #include <cstdint>
 
+#include "kivi/export.h"
+
 namespace kivi {
 
 using kern_return_t = int;
@@ -95,11 +97,11 @@ inline constexpr kern_return_t KERN_SUCCESS = 0, KERN_INVALID_ADDRESS = 1, KERN_
 inline constexpr policy_t POLICY_TIMESHARE = 1, POLICY_RR = 2, POLICY_FIFO = 4;
 
 // The calling process (its process id; a forked child gets its own).
-task_t mach_task_self();
+KIVI_EXPORT task_t mach_task_self();
 // This machine.
-host_t mach_host_self();
+KIVI_EXPORT host_t mach_host_self();
 
-struct time_value_t {
+struct KIVI_EXPORT time_value_t {
   integer_t seconds;
   integer_t microseconds;
 };
@@ -117,7 +119,7 @@ inline constexpr task_flavor_t TASK_BASIC_INFO_64 = 5;
 // then misaligned: copy them out (std::uint64_t size = info.virtual_size)
 // rather than bind a reference or pointer to them.
 #pragma pack(push, 4)
-struct task_basic_info_64_data_t {
+struct KIVI_EXPORT task_basic_info_64_data_t {
   integer_t suspend_count;
   mach_vm_size_t virtual_size;   // bytes
   mach_vm_size_t resident_size;  // bytes
@@ -126,7 +128,7 @@ struct task_basic_info_64_data_t {
   policy_t policy;
 };
 
-struct task_vm_info_data_t {
+struct KIVI_EXPORT task_vm_info_data_t {
   mach_vm_size_t virtual_size;
   integer_t region_count;
   integer_t page_size;
@@ -158,17 +160,18 @@ inline constexpr mach_msg_type_number_t TASK_VM_INFO_COUNT = 93;
 static_assert(TASK_BASIC_INFO_64_COUNT == 10);
 static_assert(sizeof(task_vm_info_data_t) == TASK_VM_INFO_COUNT * sizeof(natural_t));
 
-kern_return_t task_info(task_t task, task_flavor_t flavor, task_info_t info,
-                        mach_msg_type_number_t* count);
+KIVI_EXPORT kern_return_t task_info(task_t task, task_flavor_t flavor, task_info_t info,
+                                    mach_msg_type_number_t* count);
 
 using thread_act_array_t = thread_act_t*;
-kern_return_t task_threads(task_t task, thread_act_array_t* threads, mach_msg_type_number_t* count);
-kern_return_t vm_deallocate(task_t task, vm_address_t address, vm_size_t size);
+KIVI_EXPORT kern_return_t task_threads(task_t task, thread_act_array_t* threads,
+                                       mach_msg_type_number_t* count);
+KIVI_EXPORT kern_return_t vm_deallocate(task_t task, vm_address_t address, vm_size_t size);
 
 using thread_flavor_t = natural_t;
 using thread_info_t = integer_t*;
 inline constexpr thread_flavor_t THREAD_BASIC_INFO = 3;
-struct thread_basic_info_data_t {
+struct KIVI_EXPORT thread_basic_info_data_t {
   time_value_t user_time;
   time_value_t system_time;
   integer_t cpu_usage;  // 0…TH_USAGE_SCALE
@@ -183,22 +186,22 @@ static_assert(sizeof(thread_basic_info_data_t) == THREAD_BASIC_INFO_COUNT * size
 inline constexpr integer_t TH_USAGE_SCALE = 1000, TH_FLAGS_SWAPPED = 1, TH_FLAGS_IDLE = 2;
 inline constexpr integer_t TH_STATE_RUNNING = 1, TH_STATE_STOPPED = 2, TH_STATE_WAITING = 3,
                            TH_STATE_UNINTERRUPTIBLE = 4, TH_STATE_HALTED = 5;
-kern_return_t thread_info(thread_act_t thread, thread_flavor_t flavor, thread_info_t info,
-                          mach_msg_type_number_t* count);
+KIVI_EXPORT kern_return_t thread_info(thread_act_t thread, thread_flavor_t flavor,
+                                      thread_info_t info, mach_msg_type_number_t* count);
 
-kern_return_t host_page_size(host_t host, vm_size_t* size);
+KIVI_EXPORT kern_return_t host_page_size(host_t host, vm_size_t* size);
 
 using host_flavor_t = integer_t;
 using host_info_t = integer_t*;
 inline constexpr host_flavor_t HOST_VM_INFO = 2;
-struct vm_statistics_data_t {
+struct KIVI_EXPORT vm_statistics_data_t {
   natural_t free_count, active_count, inactive_count, wire_count, zero_fill_count, reactivations,
       pageins, pageouts, faults, cow_faults, lookups, hits, purgeable_count, purges,
       speculative_count;
 };
 inline constexpr mach_msg_type_number_t HOST_VM_INFO_COUNT = 15;
 static_assert(sizeof(vm_statistics_data_t) == HOST_VM_INFO_COUNT * sizeof(natural_t));
-kern_return_t host_statistics(host_t host, host_flavor_t flavor, host_info_t info,
-                              mach_msg_type_number_t* count);
+KIVI_EXPORT kern_return_t host_statistics(host_t host, host_flavor_t flavor, host_info_t info,
+                                          mach_msg_type_number_t* count);
 
 }  // namespace kivi

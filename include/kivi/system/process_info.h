@@ -18,9 +18,11 @@
 
 #include <cstdint>
 
+#include "kivi/export.h"
+
 namespace kivi {
 
-class ProcessInfo {
+class KIVI_EXPORT ProcessInfo {
  public:
   // The one object of the process.
   static ProcessInfo& processInfo();

@@ -51,6 +51,8 @@
 
 #include <cstddef>
 
+#include "kivi/export.h"
+
 namespace kivi {
 
 inline constexpr int CTL_KERN = 1, CTL_HW = 6;
@@ -60,9 +62,9 @@ inline constexpr int HW_MACHINE = 1, HW_NCPU = 3, HW_PHYSMEM = 5, HW_USERMEM = 6
 // The most parts a numeric name may have.
 inline constexpr unsigned int CTL_MAXNAME = 12;
 
-int sysctlbyname(const char* name, void* oldp, std::size_t* oldlenp, const void* newp,
-                 std::size_t newlen);
-int sysctl(const int* name, unsigned int namelen, void* oldp, std::size_t* oldlenp,
-           const void* newp, std::size_t newlen);
+KIVI_EXPORT int sysctlbyname(const char* name, void* oldp, std::size_t* oldlenp, const void* newp,
+                             std::size_t newlen);
+KIVI_EXPORT int sysctl(const int* name, unsigned int namelen, void* oldp, std::size_t* oldlenp,
+                       const void* newp, std::size_t newlen);
 
 }  // namespace kivi

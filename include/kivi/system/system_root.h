@@ -19,16 +19,18 @@
 #include <string>
 #include <string_view>
 
+#include "kivi/export.h"
+
 namespace kivi::system {
 
 // "/" unless a test has set another directory.
-std::string root();
+KIVI_EXPORT std::string root();
 // An empty string or "/" restores the real machine.
-void setRoot(std::string directory);
-bool isRealRoot();
+KIVI_EXPORT void setRoot(std::string directory);
+KIVI_EXPORT bool isRealRoot();
 // `absolutePath` (starting with "/") under the current root.
-std::string pathUnderRoot(std::string_view absolutePath);
+KIVI_EXPORT std::string pathUnderRoot(std::string_view absolutePath);
 // The whole file under the root, or false when it cannot be read.
-bool readFileUnderRoot(std::string_view absolutePath, std::string& contents);
+KIVI_EXPORT bool readFileUnderRoot(std::string_view absolutePath, std::string& contents);
 
 }  // namespace kivi::system

@@ -26,6 +26,7 @@
 #include <string_view>
 
 #include "kivi/base/value.h"
+#include "kivi/export.h"
 
 namespace kivi::base64 {
 
@@ -34,15 +35,15 @@ constexpr std::size_t encodedLength(std::size_t byteCount) noexcept {
   return (byteCount / 3 + (byteCount % 3 != 0)) * 4;
 }
 
-std::string encode(std::span<const std::uint8_t> bytes);
-std::string encode(std::string_view bytes);
+KIVI_EXPORT std::string encode(std::span<const std::uint8_t> bytes);
+KIVI_EXPORT std::string encode(std::string_view bytes);
 
 // The bytes `text` encodes, or std::nullopt when it is not strict standard
 // base64 (see above). The empty text decodes to no bytes.
-std::optional<Data> decode(std::string_view text);
+KIVI_EXPORT std::optional<Data> decode(std::string_view text);
 
 // As decode(), with the bytes in a std::string. They are not checked to be
 // UTF-8 or free of NUL.
-std::optional<std::string> decodeToString(std::string_view text);
+KIVI_EXPORT std::optional<std::string> decodeToString(std::string_view text);
 
 }  // namespace kivi::base64

@@ -38,10 +38,11 @@
 #include <string_view>
 
 #include "kivi/base/value.h"
+#include "kivi/export.h"
 
 namespace kivi {
 
-class DateFormatter {
+class KIVI_EXPORT DateFormatter {
  public:
   // `localeIdentifier` is an ICU locale name ("en_US_POSIX", "de-CH"),
   // `timeZoneIdentifier` an ICU zone ("UTC", "America/St_Johns", "GMT+05:45").

@@ -63,13 +63,14 @@
 
 #include "kivi/base/object.h"
 #include "kivi/base/value.h"
+#include "kivi/export.h"
 
 namespace kivi {
 
 inline constexpr int kMaxFormatField = 4096;
 
 // One argument of the engine: a tagged reference to, or copy of, a value.
-class FormatArg {
+class KIVI_EXPORT FormatArg {
  public:
   enum class Kind : std::uint8_t { Int, UInt, Double, CString, String, Value, Object, Pointer };
 
@@ -202,7 +203,8 @@ FormatArg FormatArg::from(const T& arg) noexcept {
 }
 
 // Appends `format` applied to `args` to `out`. The engine behind format().
-void appendFormat(std::string& out, std::string_view format, std::span<const FormatArg> args);
+KIVI_EXPORT void appendFormat(std::string& out, std::string_view format,
+                              std::span<const FormatArg> args);
 
 // `format` applied to `args`.
 template <class... Args>

@@ -30,10 +30,10 @@
 
 #include "kivi/base/error.h"
 #include "kivi/base/value.h"
+#include "kivi/export.h"
 
 namespace kivi {
 
-inline constexpr const char* CocoaErrorDomain = "NSCocoaErrorDomain";
 // The text is not valid JSON (or not valid UTF-8, or too deep).
 inline constexpr std::int64_t PropertyListReadCorruptError = 3840;
 // The value cannot be written as JSON.
@@ -50,7 +50,7 @@ inline constexpr JSONReadingOptions JSONReadingMutableContainers = 1;
 inline constexpr JSONReadingOptions JSONReadingMutableLeaves = 2;
 inline constexpr JSONReadingOptions JSONReadingFragmentsAllowed = 4;
 
-class JSONSerialization {
+class KIVI_EXPORT JSONSerialization {
  public:
   static constexpr std::size_t kMaxDepth = 1024;
 

@@ -37,11 +37,12 @@
 #include <string_view>
 
 #include "kivi/base/error.h"
+#include "kivi/export.h"
 
 namespace kivi {
 
 // A span of a UTF-8 text, in bytes.
-struct TextRange {
+struct KIVI_EXPORT TextRange {
   std::size_t location = 0;
   std::size_t length = 0;
 
@@ -74,7 +75,7 @@ inline constexpr std::int64_t RegularExpressionStepLimitError = 1;
 inline constexpr std::int64_t RegularExpressionBacktrackLimitError = 2;
 inline constexpr std::int64_t RegularExpressionTextTooLongError = 3;
 
-class RegularExpression {
+class KIVI_EXPORT RegularExpression {
  public:
   // Step budget of a search: 0 is unlimited. A step is ICU's unit of match
   // work, ten thousand saved backtracking states (0.2 to 1 ms); the count is

@@ -21,21 +21,23 @@
 #include <string>
 #include <string_view>
 
+#include "kivi/export.h"
+
 namespace kivi {
 
 inline constexpr std::size_t kSha256DigestLength = 32;
 using Sha256Digest = std::array<std::uint8_t, kSha256DigestLength>;
 
 // The digest of `bytes`; std::nullopt only when OpenSSL fails.
-std::optional<Sha256Digest> sha256(std::span<const std::uint8_t> bytes) noexcept;
-std::optional<Sha256Digest> sha256(std::string_view bytes) noexcept;
+KIVI_EXPORT std::optional<Sha256Digest> sha256(std::span<const std::uint8_t> bytes) noexcept;
+KIVI_EXPORT std::optional<Sha256Digest> sha256(std::string_view bytes) noexcept;
 
 // Each byte as two lowercase hexadecimal digits ("%02x"), first to last.
-std::string hexString(std::span<const std::uint8_t> bytes);
+KIVI_EXPORT std::string hexString(std::span<const std::uint8_t> bytes);
 
 // The digest of `bytes` as 64 lowercase hexadecimal digits; empty only when
 // OpenSSL fails.
-std::string sha256Hex(std::span<const std::uint8_t> bytes);
-std::string sha256Hex(std::string_view bytes);
+KIVI_EXPORT std::string sha256Hex(std::span<const std::uint8_t> bytes);
+KIVI_EXPORT std::string sha256Hex(std::string_view bytes);
 
 }  // namespace kivi

@@ -42,10 +42,11 @@
 #include "kivi/base/object.h"
 #include "kivi/base/value.h"
 #include "kivi/dispatch/kiv_dispatch_queue_protocol.h"
+#include "kivi/export.h"
 
 namespace kivi {
 
-class KivKeyValueObserver : public Object {
+class KIVI_EXPORT KivKeyValueObserver : public Object {
  public:
   using OnChangeBlock =
       std::function<void(const Value& oldValue, const Value& newValue, void* context)>;

@@ -13,9 +13,11 @@
 
 #include <functional>
 
+#include "kivi/export.h"
+
 namespace kivi {
 
-class KivMainThreadRunner {
+class KIVI_EXPORT KivMainThreadRunner {
  public:
   KivMainThreadRunner() = delete;
 

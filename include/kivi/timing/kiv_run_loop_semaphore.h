@@ -28,10 +28,11 @@
 #include <functional>
 
 #include "kivi/base/object.h"
+#include "kivi/export.h"
 
 namespace kivi {
 
-class KivRunLoopSemaphore : public Object {
+class KIVI_EXPORT KivRunLoopSemaphore : public Object {
  public:
   // Seconds waited so far → seconds of the next slice.
   using WaitStrategy = std::function<double(double elapsed)>;

@@ -33,11 +33,12 @@
 #include "kivi/dispatch/operation_queue.h"
 #include "kivi/dispatch/run_loop.h"
 #include "kivi/dispatch/timer.h"
+#include "kivi/export.h"
 #include "kivi/timing/kiv_timer_protocol.h"
 
 namespace kivi {
 
-class KivRunloopTimer : public Object, public KivTimerProtocol {
+class KIVI_EXPORT KivRunloopTimer : public Object, public KivTimerProtocol {
  public:
   using TimerBlock = std::function<void(const std::shared_ptr<KivRunloopTimer>& timer)>;
 

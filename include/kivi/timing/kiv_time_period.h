@@ -27,9 +27,11 @@
 #include <initializer_list>
 #include <span>
 
+#include "kivi/export.h"
+
 namespace kivi {
 
-class KIVTimePeriod {
+class KIVI_EXPORT KIVTimePeriod {
  public:
   enum class Case : std::uint8_t { Seconds, Minutes, Hours };
 
@@ -68,7 +70,7 @@ constexpr KIVTimePeriod hours(std::int64_t count) noexcept { return KIVTimePerio
 }  // namespace Int
 
 // The sum of the periods' timeInterval() values, added in order from 0.0.
-double timeIntervalOfPeriods(std::initializer_list<KIVTimePeriod> periods) noexcept;
-double timeIntervalOfPeriods(std::span<const KIVTimePeriod> periods) noexcept;
+KIVI_EXPORT double timeIntervalOfPeriods(std::initializer_list<KIVTimePeriod> periods) noexcept;
+KIVI_EXPORT double timeIntervalOfPeriods(std::span<const KIVTimePeriod> periods) noexcept;
 
 }  // namespace kivi

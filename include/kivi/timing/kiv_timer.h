@@ -53,6 +53,7 @@
 
 #include "kivi/base/object.h"
 #include "kivi/dispatch/operation_queue_protocol.h"
+#include "kivi/export.h"
 #include "kivi/timing/kiv_timer_operation.h"
 #include "kivi/timing/kiv_timer_protocol.h"
 
@@ -61,7 +62,7 @@ namespace kivi {
 // The shortest countdown; stands in for intervals of zero, below zero or NaN.
 inline constexpr double KivTimerMinimumTimeInterval = 0.0001;
 
-class KivTimer : public Object, public KivTimerProtocol {
+class KIVI_EXPORT KivTimer : public Object, public KivTimerProtocol {
  public:
   using CompletionBlock = std::function<void()>;
 

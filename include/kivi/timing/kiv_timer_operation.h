@@ -21,10 +21,11 @@
 #include <string>
 
 #include "kivi/dispatch/operation.h"
+#include "kivi/export.h"
 
 namespace kivi {
 
-class KivTimerOperation : public Operation {
+class KIVI_EXPORT KivTimerOperation : public Operation {
  public:
   // initWithTimeInterval:
   explicit KivTimerOperation(double timerInterval) : timerInterval_(timerInterval) {}

@@ -24,6 +24,8 @@
 #include <cstdint>
 #include <string>
 
+#include "kivi/export.h"
+
 namespace kivi {
 
 using KivTimerDisposition = std::uint64_t;
@@ -32,7 +34,7 @@ inline constexpr KivTimerDisposition KivTimerDispositionOneShot = 0;
 // Re-arms after each firing until cancel().
 inline constexpr KivTimerDisposition KivTimerDispositionRepeating = 1;
 
-class KivTimerProtocol {
+class KIVI_EXPORT KivTimerProtocol {
  public:
   virtual ~KivTimerProtocol() = default;
 

@@ -36,10 +36,11 @@
 #include <string>
 #include <string_view>
 
-#include "kivi/text/date_formatter.h"
 #include "kivi/base/error.h"
-#include "kivi/net/url.h"
 #include "kivi/base/value.h"
+#include "kivi/export.h"
+#include "kivi/net/url.h"
+#include "kivi/text/date_formatter.h"
 
 namespace kivi {
 
@@ -48,27 +49,29 @@ namespace CaseInsensitive {
 // The value of the first key, in the dictionary's order, equal to `key`
 // ignoring case (neither is trimmed); nullopt when none is. A stored null
 // marker is returned as such.
-std::optional<Value> valueForCaseInsensitiveKey(const Dictionary& dictionary, std::string_view key);
+KIVI_EXPORT std::optional<Value> valueForCaseInsensitiveKey(const Dictionary& dictionary,
+                                                            std::string_view key);
 
 // valueForCaseInsensitiveKey with `key` trimmed, then: an empty string value
 // gives `defaultValue`, or the empty string when there is no default; any
 // other value found is returned unchanged (the null marker, 0, an empty
 // array); nothing found gives `defaultValue`.
-std::optional<Value> valueForCaseInsensitiveKey(const Dictionary& dictionary, std::string_view key,
-                                                std::optional<Value> defaultValue);
+KIVI_EXPORT std::optional<Value> valueForCaseInsensitiveKey(const Dictionary& dictionary,
+                                                            std::string_view key,
+                                                            std::optional<Value> defaultValue);
 
 // The value of valueForCaseInsensitiveKey (`key` not trimmed) as a boolean:
 // a number is true when it is not zero; a string is true when, after leading
 // whitespace, one optional sign and any zeros, its next character is Y, y,
 // T, t or a digit 1 to 9 ("YES", "true", "T", "0001", "-5" are true; "NO",
 // "0", "0.9", "" are false). Anything else, or nothing, gives `defaultValue`.
-bool boolForCaseInsensitiveKey(const Dictionary& dictionary, std::string_view key,
-                               bool defaultValue);
+KIVI_EXPORT bool boolForCaseInsensitiveKey(const Dictionary& dictionary, std::string_view key,
+                                           bool defaultValue);
 
 // A copy with every key lower-cased (unicode::toLower, locale-independent);
 // values unchanged. Of keys that lower-case alike, the value of the one
 // enumerated last (the greatest in byte order) is kept.
-Dictionary dictionaryWithLowercaseKeys(const Dictionary& dictionary);
+KIVI_EXPORT Dictionary dictionaryWithLowercaseKeys(const Dictionary& dictionary);
 
 }  // namespace CaseInsensitive
 
@@ -77,7 +80,7 @@ namespace JSONSupport {
 // A key that may be missing: a string, a C string (null means no key) or
 // std::nullopt. A missing key finds nothing. Holds a view: pass it straight
 // to a getter.
-class OptionalKey {
+class KIVI_EXPORT OptionalKey {
  public:
   constexpr OptionalKey(std::nullopt_t = std::nullopt) noexcept {}
   constexpr OptionalKey(std::nullptr_t) noexcept {}
@@ -101,32 +104,34 @@ class OptionalKey {
 // when the key is missing or its value is of another kind. The pointers point
 // into `dictionary` and live as long as it does.
 
-const String* jsonStringForKey(const Dictionary& dictionary, OptionalKey key);
+KIVI_EXPORT const String* jsonStringForKey(const Dictionary& dictionary, OptionalKey key);
 // Booleans included.
-std::optional<Number> jsonNumberForKey(const Dictionary& dictionary, OptionalKey key);
+KIVI_EXPORT std::optional<Number> jsonNumberForKey(const Dictionary& dictionary, OptionalKey key);
 // jsonNumberForKey not zero; false when there is no number.
-bool jsonBoolForKey(const Dictionary& dictionary, OptionalKey key);
-const Array* jsonArrayForKey(const Dictionary& dictionary, OptionalKey key);
-const Dictionary* jsonDictionaryForKey(const Dictionary& dictionary, OptionalKey key);
+KIVI_EXPORT bool jsonBoolForKey(const Dictionary& dictionary, OptionalKey key);
+KIVI_EXPORT const Array* jsonArrayForKey(const Dictionary& dictionary, OptionalKey key);
+KIVI_EXPORT const Dictionary* jsonDictionaryForKey(const Dictionary& dictionary, OptionalKey key);
 
 // The string value parsed with KivUtils::utcDateFormatter(); nullopt when it
 // does not match the pattern exactly.
-std::optional<Date> jsonDateFromUTCStringForKey(const Dictionary& dictionary, OptionalKey key);
+KIVI_EXPORT std::optional<Date> jsonDateFromUTCStringForKey(const Dictionary& dictionary,
+                                                            OptionalKey key);
 
 // The number value read as an unsigned 64-bit count of seconds (the fraction
 // dropped), since 1970-01-01 00:00:00 UTC. A number with no unsigned 64-bit
 // reading gives nullopt: a negative one (from -1 down; -0.5 reads as 0), NaN,
 // and one of 2^64 or more.
-std::optional<Date> jsonDateFromEpochValueForKey(const Dictionary& dictionary, OptionalKey key);
+KIVI_EXPORT std::optional<Date> jsonDateFromEpochValueForKey(const Dictionary& dictionary,
+                                                             OptionalKey key);
 
 // As jsonDateFromEpochValueForKey, for a count of milliseconds; the date is
 // rounded down to the whole second (1500 and 1999 give 1970-01-01 00:00:01).
-std::optional<Date> jsonDateFromEpochMillisecondsValueForKey(const Dictionary& dictionary,
-                                                             OptionalKey key);
+KIVI_EXPORT std::optional<Date> jsonDateFromEpochMillisecondsValueForKey(
+    const Dictionary& dictionary, OptionalKey key);
 
 // The string value trimmed, as a URL (URL::URLWithString); null when it is
 // empty after trimming or not a URL.
-URLPtr jsonUrlForKey(const Dictionary& dictionary, OptionalKey key);
+KIVI_EXPORT URLPtr jsonUrlForKey(const Dictionary& dictionary, OptionalKey key);
 
 }  // namespace JSONSupport
 
@@ -136,7 +141,7 @@ namespace KivUtils {
 // and neither locale nor time zone: it formats in the process's current
 // default time zone and locale, with their offset, and parses the offset
 // written in the text. Every call returns the same instance.
-std::shared_ptr<DateFormatter> utcDateFormatter();
+KIVI_EXPORT std::shared_ptr<DateFormatter> utcDateFormatter();
 
 // Parses `text` as JSON with JSONSerialization's default options: the top
 // level must be an array or an object. nullopt when `text` is not valid
@@ -150,7 +155,7 @@ std::shared_ptr<DateFormatter> utcDateFormatter();
 //   } catch (const kivi::ErrorPtr& error) {
 //     log(error->description());
 //   }
-std::optional<Value> toJSONObject(std::string_view text);
+KIVI_EXPORT std::optional<Value> toJSONObject(std::string_view text);
 
 }  // namespace KivUtils
 

@@ -45,6 +45,7 @@
 #include <vector>
 
 #include "kivi/base/value.h"
+#include "kivi/export.h"
 
 namespace kivi::KivUtils {
 
@@ -52,64 +53,66 @@ namespace kivi::KivUtils {
 
 // SHA-256 of the string's UTF-8 bytes as 64 lowercase hexadecimal digits;
 // std::nullopt when the string is not valid UTF-8.
-std::optional<std::string> sha256Hash(std::string_view string);
+KIVI_EXPORT std::optional<std::string> sha256Hash(std::string_view string);
 
 // The string without leading and trailing white space and line breaks (the
 // Unicode set: category Zs, U+0009–U+000D, U+0085, U+2028, U+2029).
-std::string trim(std::string_view string);
+KIVI_EXPORT std::string trim(std::string_view string);
 
 // Whether the strings are equal ignoring case, treating canonically
 // equivalent forms as equal ("É" equals "e" + U+0301), whatever the locale.
 // No trimming. Text that is not valid UTF-8 equals only the same bytes.
-bool isCaseInsensitiveEqualToString(std::string_view string, std::string_view other);
+KIVI_EXPORT bool isCaseInsensitiveEqualToString(std::string_view string, std::string_view other);
 
 // The string split at every occurrence of `separator` (literally; an empty
 // separator never occurs), each part trimmed, empty parts dropped. Null when
 // no part remains.
-std::optional<std::vector<std::string>> trimmedCommponentsSeparatedByString(
+KIVI_EXPORT std::optional<std::vector<std::string>> trimmedCommponentsSeparatedByString(
     std::string_view string, std::string_view separator);
 
 // Standard base64 of the UTF-8 bytes, padded, without line breaks; null when
 // the string is not valid UTF-8.
-std::optional<std::string> encodeIntoBase64String(std::string_view string);
+KIVI_EXPORT std::optional<std::string> encodeIntoBase64String(std::string_view string);
 
 // The text that strict standard base64 encodes (see kivi/text/base64.h);
 // null when the string is not such base64 or the bytes are not valid UTF-8.
-std::optional<std::string> decodeFromBase64String(std::string_view string);
+KIVI_EXPORT std::optional<std::string> decodeFromBase64String(std::string_view string);
 
 // URL-safe base64 turned into standard base64 text, nothing decoded: "-" and
 // "_" become "+" and "/", and "=" is appended until the length is a multiple
 // of four.
-std::string base64FromBase64URLEncodedString(std::string_view string);
+KIVI_EXPORT std::string base64FromBase64URLEncodedString(std::string_view string);
 
 // URL-safe base64 of the UTF-8 bytes ("-" and "_" for "+" and "/"), without
 // padding; null when the string is not valid UTF-8.
-std::optional<std::string> base64URLEncodedStringFromString(std::string_view string);
+KIVI_EXPORT std::optional<std::string> base64URLEncodedStringFromString(std::string_view string);
 
 // vrel base64 of the UTF-8 bytes: "_", "!" and "-" for "+", "/" and "=";
 // null when the string is not valid UTF-8.
-std::optional<std::string> vrelBase64URLEncodedStringFromString(std::string_view string);
+KIVI_EXPORT std::optional<std::string> vrelBase64URLEncodedStringFromString(
+    std::string_view string);
 
 // The text of vrel base64: "_", "!" and "-" become "+", "/" and "=", and the
 // result is decoded as decodeFromBase64String does (no padding is added).
-std::optional<std::string> decodeFromVrelBase64URLEncodedString(std::string_view string);
+KIVI_EXPORT std::optional<std::string> decodeFromVrelBase64URLEncodedString(
+    std::string_view string);
 
 // The string itself when it is not empty, else the empty string.
-std::string stringOrEmptyString(const std::optional<std::string>& string);
+KIVI_EXPORT std::string stringOrEmptyString(const std::optional<std::string>& string);
 
 // Whether the string is null, or empty after trim().
-bool isNilOrEmptyString(const std::optional<std::string>& string);
+KIVI_EXPORT bool isNilOrEmptyString(const std::optional<std::string>& string);
 
 // ---- Byte data ----
 
 // SHA-256 of the bytes as 64 lowercase hexadecimal digits.
-std::string sha256AsString(const Data& data);
+KIVI_EXPORT std::string sha256AsString(const Data& data);
 
 // ---- Heterogeneous arrays ----
 
 // Whether some string element, trimmed, equals the trimmed needle as
 // isCaseInsensitiveEqualToString() compares. Other kinds never match.
-bool trimmedCaseInsensitiveContains(const Array& array, std::string_view needle);
+KIVI_EXPORT bool trimmedCaseInsensitiveContains(const Array& array, std::string_view needle);
 
 // The elements for which `test(element, index, &stop)` returns true, in
 // order. Once the test sets `stop`, no further element is tested; the answer
@@ -128,8 +131,8 @@ Array subarrayWithObjectsPassingTest(const Array& array, Test&& test) {
 }
 
 // The elements that are dictionaries, and those that are strings, in order.
-Array subArrayOfDictionaries(const Array& array);
-Array subArrayOfStrings(const Array& array);
+KIVI_EXPORT Array subArrayOfDictionaries(const Array& array);
+KIVI_EXPORT Array subArrayOfStrings(const Array& array);
 
 // ---- Typed arrays ----
 

@@ -33,6 +33,7 @@
 #include <string_view>
 #include <vector>
 
+#include "kivi/export.h"
 #include "kivi/net/http_cookie.h"
 #include "kivi/net/url.h"
 #include "kivi/net/url_components.h"
@@ -45,7 +46,7 @@ namespace KiviOSSdkUtils {
 // existing ones as they are written (names are never merged; an existing
 // value that does not decode keeps its text). An empty `items` changes
 // nothing, not even an empty query.
-void addQueryItems(URLComponents& components, const std::vector<URLQueryItem>& items);
+KIVI_EXPORT void addQueryItems(URLComponents& components, const std::vector<URLQueryItem>& items);
 }  // namespace KiviOSSdkUtils
 
 // The items of `queryString` (the text after "?") that have a value (an empty
@@ -53,19 +54,21 @@ void addQueryItems(URLComponents& components, const std::vector<URLQueryItem>& i
 // not UTF-8), decoded; "+" stays "+"; a name that is not UTF-8 decoded is
 // listed as "". A name given more than once keeps its last value. Empty when
 // the text is not a query.
-std::map<std::string, std::string> getQueryItemsDictionary(std::string_view queryString);
+KIVI_EXPORT std::map<std::string, std::string> getQueryItemsDictionary(
+    std::string_view queryString);
 
 namespace CustomHeaders {
 // Sets each header field of `headers` on `request`, replacing a value set
 // earlier under the same name in any letter case; other fields stay. None
 // changes nothing.
-void setHeaders(MutableURLRequest& request, const std::optional<StringDictionary>& headers);
+KIVI_EXPORT void setHeaders(MutableURLRequest& request,
+                            const std::optional<StringDictionary>& headers);
 }  // namespace CustomHeaders
 
 // A URL made from text that is already a valid URL reference: unlike
 // URL::URLWithString, nothing is percent-encoded, so text holding a space or
 // a non-ASCII character gives null.
-class KivURL : public URL {
+class KIVI_EXPORT KivURL : public URL {
  public:
   static std::shared_ptr<const KivURL> initWithString(std::string_view string);
   // Null for none; otherwise initWithString().
@@ -77,7 +80,7 @@ class KivURL : public URL {
   explicit KivURL(std::string string) : URL(std::move(string)) {}
 };
 
-class HTTPCookieUtils {
+class KIVI_EXPORT HTTPCookieUtils {
  public:
   // The cookies, in their order, whose domain (lowercased, without leading
   // and trailing dots) ends with one of `domains` (lowercased). This is a

@@ -1,0 +1,110 @@
+#!/usr/bin/env python3
+"""Doxygen input filter: reads a public header's plain // comments as
+documentation, so the headers keep one comment style.
+
+- The comment that opens the header documents the file.
+- A comment block right before a declaration documents it (one followed by
+  a blank line stays a plain comment); a comment after
+  code on the same line documents that line's member.
+- A comment over several declarations with no blank line between them
+  documents each of them (a Doxygen member group).
+- Lines indented by two or more spaces inside a comment (usage samples,
+  tables) are kept as preformatted code.
+Everything else passes through unchanged. The commands it adds take lines
+of their own, so a warning's line number may be a few lines past the one in
+the header.
+"""
+import re
+import sys
+
+
+def convert_block(block, indent, first_line_prefix=""):
+    out = []
+    in_code = False
+    for text in block:
+        body = text[2:] if text.startswith("  ") else None
+        is_code = text.startswith("  ") and text.strip() != ""
+        if is_code and not in_code:
+            out.append(f"{indent}/// \\code{{.unparsed}}")
+            in_code = True
+        elif not is_code and in_code and text.strip() != "":
+            out.append(f"{indent}/// \\endcode")
+            in_code = False
+        out.append(f"{indent}/// {text}".rstrip())
+    if in_code:
+        out.append(f"{indent}/// \\endcode")
+    if first_line_prefix:
+        out.insert(0, f"{indent}/// {first_line_prefix}")
+    return out
+
+
+def starts_declaration(line, indent):
+    return (line.startswith(indent) and len(line) > len(indent) and not line[len(indent)].isspace()
+            and not line.lstrip().startswith(("}", "//", "#", "public:", "protected:", "private:")))
+
+
+def group_end(lines, start, indent):
+    """The end of the lines after a comment that it speaks for: up to a blank
+    line, a comment, or a line indented less than the comment."""
+    k = start
+    while k < len(lines):
+        line = lines[k]
+        if not line.strip() or line.lstrip().startswith("//"):
+            break
+        if not line.startswith(indent) or (len(line) - len(line.lstrip()) < len(indent)):
+            break
+        if line.lstrip().startswith(("public:", "protected:", "private:", "}")) \
+                and len(line) - len(line.lstrip()) <= len(indent):
+            break
+        k += 1
+    return k
+
+
+def main():
+    path = sys.argv[1]
+    lines = open(path, encoding="utf-8").read().split("\n")
+    out = []
+    i = 0
+    seen_code = False
+    while i < len(lines):
+        line = lines[i]
+        m = re.match(r"^(\s*)//(?!/)(.*)$", line)
+        if m:
+            indent = m.group(1)
+            block = []
+            while i < len(lines):
+                mm = re.match(r"^(\s*)//(?!/) ?(.*)$", lines[i])
+                if not mm or mm.group(1) != indent:
+                    break
+                block.append(mm.group(2))
+                i += 1
+            following = lines[i] if i < len(lines) else ""
+            if not seen_code:  # the header's opening comment
+                out.extend(convert_block(block, indent, "\\file"))
+            elif following.strip() and not following.lstrip().startswith("#"):
+                end = group_end(lines, i, indent)
+                declarations = sum(1 for k in range(i, end) if starts_declaration(lines[k], indent))
+                if declarations > 1:  # one comment for several lines: a group
+                    out.append(f"{indent}///@{{")
+                    out.extend(convert_block(block, indent))
+                    out.extend(lines[i:end])
+                    out.append(f"{indent}///@}}")
+                    i = end
+                else:
+                    out.extend(convert_block(block, indent))
+            else:  # a heading or a note that documents nothing
+                out.extend(f"{indent}// {text}".rstrip() for text in block)
+            seen_code = True
+            continue
+        trailing = re.match(r"^(\s*\S.*?;)(\s+)//(?!/) ?(.*)$", line)
+        if trailing and '"' not in trailing.group(1).split(";")[-1]:
+            line = f"{trailing.group(1)}{trailing.group(2)}///< {trailing.group(3)}"
+        if line.strip():
+            seen_code = True
+        out.append(line)
+        i += 1
+    sys.stdout.write("\n".join(out))
+
+
+if __name__ == "__main__":
+    main()
