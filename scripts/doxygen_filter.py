@@ -30,7 +30,7 @@ def convert_block(block, indent, first_line_prefix=""):
         elif not is_code and in_code and text.strip() != "":
             out.append(f"{indent}/// \\endcode")
             in_code = False
-        out.append(f"{indent}/// {text}".rstrip())
+        out.append(f"{indent}/// {text if is_code else escape_tags(text)}".rstrip())
     if in_code:
         out.append(f"{indent}/// \\endcode")
     if first_line_prefix:
@@ -60,9 +60,36 @@ def group_end(lines, start, indent):
     return k
 
 
+CLASS = re.compile(r"^(?:class|struct)\s+(?:KIVI_EXPORT\s+)?(\w+)\b[^;]*$")
+
+
+def principal_class(lines):
+    """The class the header's opening comment introduces by name in its
+    first line, when that class has no comment of its own: its line index."""
+    if not lines or not lines[0].startswith("//"):
+        return None
+    named = set(re.findall(r"\w+", lines[0]))
+    for k, line in enumerate(lines):
+        m = CLASS.match(line)
+        if m and m.group(1) in named and k > 0 and not lines[k - 1].lstrip().startswith("//") \
+                and not lines[k - 1].startswith("template"):
+            return k
+    return None
+
+
+def escape_tags(text):
+    """Keeps <pid>, <dir> and the like as text outside `code spans`."""
+    parts = text.split("`")
+    for n in range(0, len(parts), 2):
+        parts[n] = re.sub(r"<(?=[A-Za-z/])", r"\\<", parts[n])
+    return "`".join(parts)
+
+
 def main():
     path = sys.argv[1]
     lines = open(path, encoding="utf-8").read().split("\n")
+    principal = principal_class(lines)
+    opening = []
     out = []
     i = 0
     seen_code = False
@@ -79,9 +106,14 @@ def main():
                 block.append(mm.group(2))
                 i += 1
             following = lines[i] if i < len(lines) else ""
-            if not seen_code:  # the header's opening comment
+            if not seen_code and principal is not None:
+                # The opening comment is the principal class's documentation.
+                opening = convert_block(block, indent)
+                out.append("/// \\file")
+            elif not seen_code:  # the header's opening comment
                 out.extend(convert_block(block, indent, "\\file"))
-            elif following.strip() and not following.lstrip().startswith("#"):
+            elif following.strip() and (not following.lstrip().startswith("#")
+                                        or following.lstrip().startswith("#define")):
                 end = group_end(lines, i, indent)
                 declarations = sum(1 for k in range(i, end) if starts_declaration(lines[k], indent))
                 if declarations > 1:  # one comment for several lines: a group
@@ -101,6 +133,8 @@ def main():
             line = f"{trailing.group(1)}{trailing.group(2)}///< {trailing.group(3)}"
         if line.strip():
             seen_code = True
+        if i == principal:
+            out.extend(opening)
         out.append(line)
         i += 1
     sys.stdout.write("\n".join(out))

@@ -36,7 +36,9 @@
 //
 //   kivi::ErrorPtr error;
 //   const auto value = ulo.getValue(name, &error);
-//   if (error) { /* undecided: error->domain() is RegularExpressionSearchErrorDomain */ }
+//   if (error) {
+//     // undecided: error->domain() is RegularExpressionSearchErrorDomain
+//   }
 //
 // Thread contract: a parser is immutable after construction; lookups on one
 // parser may run on any number of threads at once.
