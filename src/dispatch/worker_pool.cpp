@@ -375,6 +375,7 @@ void WorkerPool::submit(std::function<void()> job) { submit(std::move(job), null
 
 void WorkerPool::submit(std::function<void()> work, const void* queue,
                         std::shared_ptr<const void> keepAlive) {
+  if (!work) return;  // nothing to run; a worker would throw calling it
   State& s = *state_;
   bool wake = false;
   bool monitor = false;

@@ -60,12 +60,24 @@ void KivRunloopTimer::onTimerTriggered(const TimerPtr&) {
   auto strong = std::static_pointer_cast<KivRunloopTimer>(weak_from_this().lock());
   if (!strong) return;
   std::weak_ptr<KivRunloopTimer> weak = strong;
+  const auto queue = operationQueue();
+  if (!queue) return;
   // The job keeps the timer alive until it has run.
-  operationQueue_->addOperation(std::make_shared<BlockOperation>([strong, weak] {
+  queue->addOperation(std::make_shared<BlockOperation>([strong, weak] {
     if (auto self = weak.lock()) {
       if (auto block = self->timerBlock()) block(self);
     }
   }));
+}
+
+std::shared_ptr<OperationQueue> KivRunloopTimer::operationQueue() const {
+  std::lock_guard lock(monitor_);
+  return operationQueue_;
+}
+
+void KivRunloopTimer::setOperationQueue(std::shared_ptr<OperationQueue> queue) {
+  std::lock_guard lock(monitor_);
+  operationQueue_ = std::move(queue);
 }
 
 TimerPtr KivRunloopTimer::timer() const {

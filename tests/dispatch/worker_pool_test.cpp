@@ -36,6 +36,7 @@ void runBurst(int jobs) {
 // Each round first checks that every job runs, jobs submitted by jobs included.
 TEST(WorkerPool, RunsEveryJobAndBlockedJobsDoNotHoldBackLaterOnes) {
   EXPECT_FALSE(WorkerPool::isWorkerThread());
+  WorkerPool::shared().submit(nullptr);  // ignored; calling it would end the process
   // More blocked jobs than cores, after a burst that leaves idle workers behind:
   // the last job needs an idle or a new worker promptly (an idle worker's
   // timeout is no substitute for a wake-up).

@@ -59,6 +59,14 @@ TEST(KivRunloopTimerTest, FiresOnlyWhileTheMainRunLoopRunsItsMode) {
   timer->operationQueue()->waitUntilAllOperationsAreFinished();
   EXPECT_EQ(firings.count, 0);
   EXPECT_TRUE(runMainUntil("kivi.test.modal", [&] { return firings.count >= 3; }));
+  // Without a queue the firings run nothing (and do not crash).
+  const auto queue = timer->operationQueue();
+  timer->setOperationQueue(nullptr);
+  queue->waitUntilAllOperationsAreFinished();
+  const int before = firings.count;
+  RunLoop::mainRunLoop()->runMode("kivi.test.modal", in(0.05));
+  EXPECT_EQ(firings.count, before);
+  timer->setOperationQueue(queue);
   timer->cancel();
   EXPECT_EQ(timer->timer(), nullptr);
 }
@@ -105,8 +113,7 @@ TEST(KivRunloopTimerTest, StartRestartsAndAnArmedTimerKeepsItselfAlive) {
 TEST(KivRunloopTimerTest, AnyDispositionButRepeatingFiresOnce) {
   for (KivTimerDisposition disposition : {KivTimerDispositionOneShot, KivTimerDisposition{2}}) {
     Firings firings;
-    auto timer =
-        KivRunloopTimer::create(0.001, NSDefaultRunLoopMode, disposition, firings.block());
+    auto timer = KivRunloopTimer::create(0.001, NSDefaultRunLoopMode, disposition, firings.block());
     timer->start();
     EXPECT_TRUE(runMainUntil(NSDefaultRunLoopMode, [&] { return firings.count >= 1; }));
     RunLoop::mainRunLoop()->runUntilDate(in(0.02));

@@ -36,8 +36,10 @@ namespace kivi {
 
 class KIVI_EXPORT WorkerPool {
  public:
+  // The pool of the process, started on first use.
   static WorkerPool& shared();
 
+  // Runs `job` on a worker as soon as one is free; an empty `job` is ignored.
   void submit(std::function<void()> job);
   // For dispatch queues: the job runs as work of `queue`, which `keepAlive`
   // (if any) keeps alive until the job has run.
@@ -62,12 +64,14 @@ class KIVI_EXPORT WorkerPool {
   // How many workers the pool keeps running.
   std::size_t width() const noexcept;
 
+  // What the pool is doing, as statistics() saw it.
   struct Statistics {
     std::size_t threads = 0;  // alive (or starting)
     std::size_t idle = 0;     // waiting for work
     std::size_t blocked = 0;  // inside a blocking call or BlockingScope
     std::size_t queued = 0;   // jobs not yet taken by a worker
   };
+  // A snapshot, for diagnostics and tests; it may be out of date when read.
   Statistics statistics() const;
 
   // The most threads the pool will run at once.

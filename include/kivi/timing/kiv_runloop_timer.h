@@ -40,6 +40,7 @@ namespace kivi {
 
 class KIVI_EXPORT KivRunloopTimer : public Object, public KivTimerProtocol {
  public:
+  // The callback; it is given the timer that fired.
   using TimerBlock = std::function<void(const std::shared_ptr<KivRunloopTimer>& timer)>;
 
   // initWithTimeInterval:runloopMode:timerDisposition:block: — does not
@@ -49,6 +50,7 @@ class KIVI_EXPORT KivRunloopTimer : public Object, public KivTimerProtocol {
                                                                RunLoopMode runloopMode,
                                                                KivTimerDisposition disposition,
                                                                TimerBlock block);
+
   ~KivRunloopTimer() override;
 
   // Stops an armed timer and arms a fresh one on the main run loop.
@@ -61,20 +63,26 @@ class KIVI_EXPORT KivRunloopTimer : public Object, public KivTimerProtocol {
   // Invalidates the run-loop timer if it is valid and forgets it.
   void stopTimer();
 
+  // Seconds from start() to the first firing and between firings; read by start().
   double timeInterval() const { return timeInterval_; }
   void setTimeInterval(double interval) { timeInterval_ = interval; }
+  // The run loop's timer while armed, null otherwise.
   TimerPtr timer() const;
   void setTimer(TimerPtr timer);
+  // The main run loop's mode the timer fires in; read by start(), which arms nothing for an
+  // empty mode.
   const RunLoopMode& runloopMode() const { return runloopMode_; }
   void setRunloopMode(RunLoopMode mode) { runloopMode_ = std::move(mode); }
+  // The callback; a new one applies to the invocations that have not run yet.
   TimerBlock timerBlock() const;
   void setTimerBlock(TimerBlock block);
+  // Repeating or one-shot (see KivTimerProtocol); read by start().
   KivTimerDisposition timerDisposition() const { return timerDisposition_; }
   void setTimerDisposition(KivTimerDisposition disposition) { timerDisposition_ = disposition; }
-  const std::shared_ptr<OperationQueue>& operationQueue() const { return operationQueue_; }
-  void setOperationQueue(std::shared_ptr<OperationQueue> queue) {
-    operationQueue_ = std::move(queue);
-  }
+  // The queue the callback runs on: a private one that runs one invocation at a time, made
+  // with the timer. While it is null, firings run nothing.
+  std::shared_ptr<OperationQueue> operationQueue() const;
+  void setOperationQueue(std::shared_ptr<OperationQueue> queue);
 
   std::string description() const override { return Object::description(); }
   std::string className() const override { return "KivRunloopTimer"; }
@@ -90,7 +98,7 @@ class KIVI_EXPORT KivRunloopTimer : public Object, public KivTimerProtocol {
   RunLoopMode runloopMode_;
   TimerBlock timerBlock_;  // guarded by monitor_
   KivTimerDisposition timerDisposition_;
-  std::shared_ptr<OperationQueue> operationQueue_;
+  std::shared_ptr<OperationQueue> operationQueue_;  // guarded by monitor_
 };
 
 }  // namespace kivi
