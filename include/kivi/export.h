@@ -9,4 +9,5 @@
 // Consumers see the same mark; on ELF it changes nothing for them.
 #pragma once
 
+// Default visibility: the symbol is exported.
 #define KIVI_EXPORT __attribute__((visibility("default")))

@@ -33,10 +33,12 @@ inline constexpr const char* DebugDescriptionErrorKey = "NSDebugDescription";
 
 class KIVI_EXPORT Error final : public Object {
  public:
+  // An error in `domain` with `code` and `userInfo`; create() hands it out shared.
   Error(std::string domain, std::int64_t code, Dictionary userInfo = {});
   static std::shared_ptr<const Error> create(std::string domain, std::int64_t code,
                                              Dictionary userInfo = {});
 
+  // The domain, code and user info given at creation.
   const std::string& domain() const noexcept { return domain_; }
   std::int64_t code() const noexcept { return code_; }
   const Dictionary& userInfo() const noexcept { return userInfo_; }
@@ -58,6 +60,7 @@ class KIVI_EXPORT Error final : public Object {
   const Dictionary userInfo_;
 };
 
+// How errors are passed around: shared and immutable; null means no error.
 using ErrorPtr = std::shared_ptr<const Error>;
 
 }  // namespace kivi

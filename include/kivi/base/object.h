@@ -46,10 +46,15 @@
 
 namespace kivi {
 
+// What an observation asks for, as a bitwise OR of the options below (0: only the kind).
 using KeyValueObservingOptions = std::uint64_t;
+// The change dictionary carries "new", the value after the change.
 inline constexpr KeyValueObservingOptions KeyValueObservingOptionNew = 0x01;
+// The change dictionary carries "old", the value before the change.
 inline constexpr KeyValueObservingOptions KeyValueObservingOptionOld = 0x02;
+// addObserver() sends one notification at once (with "new" when New is set too).
 inline constexpr KeyValueObservingOptions KeyValueObservingOptionInitial = 0x04;
+// willChangeValueForKey() sends a prior notification too (with "old" when Old is set).
 inline constexpr KeyValueObservingOptions KeyValueObservingOptionPrior = 0x08;
 
 // Keys of a change dictionary.
@@ -77,6 +82,8 @@ class KIVI_EXPORT Object : public std::enable_shared_from_this<Object> {
   // The value of an observable property; the null marker for unknown keys.
   virtual Value valueForKey(std::string_view key) const;
 
+  // Announce a change of `key`: will before it, did after it, paired on the same thread.
+  // The observers of `key` are told as described above; did then calls keyValueDidChange().
   void willChangeValueForKey(std::string_view key);
   void didChangeValueForKey(std::string_view key);
 
@@ -115,6 +122,7 @@ class KIVI_EXPORT Object : public std::enable_shared_from_this<Object> {
   mutable std::atomic<ObservationInfo*> observationInfo_{nullptr};
 };
 
+// How objects with identity are held.
 using ObjectPtr = std::shared_ptr<Object>;
 
 }  // namespace kivi

@@ -20,12 +20,16 @@ class KIVI_EXPORT RecursiveLock : public Object {
  public:
   RecursiveLock() = default;
 
+  // Waits until the lock is free or already held by this thread, then takes it.
   void lock() { mutex_.lock(); }
+  // Releases one lock() (or successful tryLock()) of the holding thread.
   void unlock() { mutex_.unlock(); }
+  // Takes the lock if it can without waiting; false when another thread holds it.
   bool tryLock() { return mutex_.try_lock(); }
   // BasicLockable / Lockable spellings.
   bool try_lock() { return tryLock(); }
 
+  // A name for debugging; empty until set.
   std::string name() const;
   void setName(std::string name);
 

@@ -73,6 +73,7 @@ struct ValueNode;
 class DocumentBuilder;
 }  // namespace detail
 
+// How a URL (the network layer's type) is held, also inside a Value.
 using URLPtr = std::shared_ptr<const URL>;
 
 // The platform's NSNull.
@@ -80,11 +81,12 @@ struct KIVI_EXPORT Null {
   friend KIVI_EXPORT bool operator==(Null, Null) { return true; }
 };
 
+// Raw bytes: the data kind of a Value.
 using Data = std::vector<std::uint8_t>;
 
 // A point in time: seconds since 1970-01-01T00:00:00Z.
 struct KIVI_EXPORT Date {
-  double timeIntervalSince1970 = 0;
+  double timeIntervalSince1970 = 0;  // negative before 1970
   friend auto operator<=>(const Date&, const Date&) = default;
 
   // The wall clock now.
@@ -108,20 +110,26 @@ struct KIVI_EXPORT Date {
 // their values are equal, whatever their flavours (true == 1).
 class KIVI_EXPORT Number {
  public:
+  // The flavour a number was made with: bool, signed, unsigned or floating point.
   enum class Type : std::uint8_t { Bool, Int, UInt, Double };
 
+  // A number of the argument's flavour; the default is the signed 0.
   constexpr Number() noexcept : type_(Type::Int), i_(0) {}
   constexpr explicit Number(bool b) noexcept : type_(Type::Bool), i_(b ? 1 : 0) {}
   constexpr explicit Number(std::int64_t i) noexcept : type_(Type::Int), i_(i) {}
   constexpr explicit Number(std::uint64_t u) noexcept : type_(Type::UInt), u_(u) {}
   constexpr explicit Number(double d) noexcept : type_(Type::Double), d_(d) {}
 
+  // The flavour; isInteger() holds for Bool, Int and UInt.
   Type type() const noexcept { return type_; }
   bool isBool() const noexcept { return type_ == Type::Bool; }
   bool isInteger() const noexcept { return type_ != Type::Double; }
 
+  // The value as another type: boolValue() is whether it is non-zero; a floating-point value
+  // is truncated and saturates out of range (NaN gives 0); a negative value read unsigned
+  // wraps (two's complement).
   bool boolValue() const noexcept;
-  std::int64_t longLongValue() const noexcept;  // truncates; saturates out of range
+  std::int64_t longLongValue() const noexcept;
   std::uint64_t unsignedLongLongValue() const noexcept;
   double doubleValue() const noexcept;
 
@@ -148,12 +156,15 @@ class KIVI_EXPORT Number {
 //   if (key == "name") ...
 class KIVI_EXPORT String {
  public:
+  // The longest text, in bytes, kept inside the String itself.
   static constexpr std::size_t kInlineCapacity = 22;
 
+  // Empty, or a copy of `text` (a null `const char*` gives the empty string).
   String() noexcept { bytes_[kTagByte] = 0; }
   String(std::string_view text);
   String(const char* text) : String(std::string_view(text ? text : "")) {}
   String(const std::string& text) : String(std::string_view(text)) {}
+  // Copies; a longer text is shared, not duplicated.
   String(const String& other) {
     if (other.isInline()) {
       std::memcpy(bytes_, other.bytes_, sizeof bytes_);
@@ -161,10 +172,12 @@ class KIVI_EXPORT String {
       copySlow(other);
     }
   }
+  // Moves; `other` is left empty.
   String(String&& other) noexcept {
     std::memcpy(bytes_, other.bytes_, sizeof bytes_);
     other.bytes_[kTagByte] = 0;
   }
+  // Assigns a copy, shared as the copy constructor does.
   String& operator=(const String& other) {
     if (this != &other) {
       String copy(other);
@@ -172,6 +185,7 @@ class KIVI_EXPORT String {
     }
     return *this;
   }
+  // Assigns by moving; `other` is left empty.
   String& operator=(String&& other) noexcept {
     if (this != &other) {
       String moved(std::move(other));
@@ -183,9 +197,11 @@ class KIVI_EXPORT String {
     if (!isInline()) releaseSlow();
   }
 
+  // The bytes of the text; they are not followed by a NUL.
   const char* data() const noexcept {
     return isInline() ? bytes_ : static_cast<const char*>(pointer());
   }
+  // The length in bytes (length() alike) and the bytes as a range; [] does not check `i`.
   std::size_t size() const noexcept { return isInline() ? tag() : outOfLineSize(); }
   std::size_t length() const noexcept { return size(); }
   bool empty() const noexcept { return size() == 0; }
@@ -193,12 +209,14 @@ class KIVI_EXPORT String {
   const char* end() const noexcept { return data() + size(); }
   char operator[](std::size_t i) const noexcept { return data()[i]; }
 
+  // The text as a view, valid while this String lives unchanged, or copied out by str().
   std::string_view view() const noexcept { return {data(), size()}; }
   operator std::string_view() const noexcept { return view(); }
   std::string str() const { return std::string(view()); }
   // Implicit, as a std::string argument is the common case; it copies.
   operator std::string() const { return str(); }
 
+  // Exchanges the texts of two strings; never allocates.
   void swap(String& other) noexcept {
     unsigned char t[sizeof bytes_];
     std::memcpy(t, bytes_, sizeof t);
@@ -280,6 +298,7 @@ static_assert(sizeof(String) == 23);
 
 class KIVI_EXPORT Value {
  public:
+  // What a value holds; the table above shows each kind.
   enum class Kind : std::uint8_t {
     Null,
     Number,
@@ -292,7 +311,9 @@ class KIVI_EXPORT Value {
     Object
   };
 
+  // The null marker.
   Value() noexcept { kind_ = Kind::Null; }
+  // Copies; a longer string, data, a collection or an object is shared, not duplicated.
   Value(const Value& other) {
     if (other.isPlain()) {
       std::memcpy(static_cast<void*>(this), &other, sizeof(Value));
@@ -300,10 +321,12 @@ class KIVI_EXPORT Value {
       copySlow(other);
     }
   }
+  // Moves; `other` is left the null marker.
   Value(Value&& other) noexcept {
     std::memcpy(static_cast<void*>(this), &other, sizeof(Value));
     other.kind_ = Kind::Null;
   }
+  // Assigns a copy, shared as the copy constructor does.
   Value& operator=(const Value& other) {
     if (this != &other) {
       Value copy(other);
@@ -311,6 +334,7 @@ class KIVI_EXPORT Value {
     }
     return *this;
   }
+  // Assigns by moving; `other` is left the null marker.
   Value& operator=(Value&& other) noexcept {
     if (this != &other) {
       Value moved(std::move(other));
@@ -324,8 +348,10 @@ class KIVI_EXPORT Value {
     if (!isPlain()) releaseSlow();
   }
 
+  // The null marker.
   Value(std::nullptr_t) noexcept : Value() {}
   Value(Null) noexcept : Value() {}
+  // A number of the argument's flavour: bool, signed, unsigned or floating point.
   Value(Number n) noexcept { setNumber(n); }
   Value(bool b) noexcept { setNumber(Number(b)); }
   Value(int i) noexcept { setNumber(Number(static_cast<std::int64_t>(i))); }
@@ -335,14 +361,18 @@ class KIVI_EXPORT Value {
   Value(unsigned long i) noexcept { setNumber(Number(static_cast<std::uint64_t>(i))); }
   Value(unsigned long long i) noexcept { setNumber(Number(static_cast<std::uint64_t>(i))); }
   Value(double d) noexcept { setNumber(Number(d)); }
+  // A string.
   Value(String s) noexcept {
     new (raw_) String(std::move(s));
     kind_ = Kind::String;
   }
+  // A string with a copy of `s` (a null `const char*` gives the empty string).
   Value(const char* s) : Value(String(s)) {}
   Value(const std::string& s) : Value(String(s)) {}
   Value(std::string_view s) : Value(String(s)) {}
+  // Raw bytes.
   Value(Data d);
+  // A date.
   Value(Date d) noexcept {
     new (raw_) Date(d);
     kind_ = Kind::Date;
@@ -355,8 +385,10 @@ class KIVI_EXPORT Value {
       : Value() {
     if (url) setURL(std::shared_ptr<const Object>(URLPtr(std::move(url))));
   }
+  // An array or a dictionary; from now on it is immutable and shared between copies.
   Value(Array a);
   Value(Dictionary d);
+  // A library object, of any Object subclass; a null pointer gives the null marker.
   Value(std::shared_ptr<Object> o);
   template <class T>
   requires(!std::is_same_v<T, Object> &&
@@ -364,25 +396,31 @@ class KIVI_EXPORT Value {
            !std::is_convertible_v<std::shared_ptr<T>, URLPtr>) Value(std::shared_ptr<T> o)
       : Value(std::shared_ptr<Object>(std::move(o))) {}
 
+  // What the value holds; isNull() for the null marker.
   Kind kind() const noexcept { return kind_; }
   bool isNull() const noexcept { return kind_ == Kind::Null; }
 
-  // Typed views; null when the value is of another kind.
+  // The number held; this and the views below are null for a value of another kind.
   const Number* asNumber() const noexcept {
     return kind_ == Kind::Number ? std::launder(reinterpret_cast<const Number*>(raw_)) : nullptr;
   }
+  // The text of a string value.
   const String* asString() const noexcept {
     return kind_ == Kind::String ? std::launder(reinterpret_cast<const String*>(raw_)) : nullptr;
   }
+  // The bytes of a data value.
   const Data* asData() const noexcept;
+  // The date held.
   const Date* asDate() const noexcept {
     return kind_ == Kind::Date ? std::launder(reinterpret_cast<const Date*>(raw_)) : nullptr;
   }
+  // The URL held, as the network layer's URL type.
   template <class U = URL>
   std::shared_ptr<const U> asURL() const noexcept {
     const std::shared_ptr<const Object>* url = urlObject();
     return url ? std::static_pointer_cast<const U>(*url) : nullptr;
   }
+  // The array, dictionary or library object held.
   const Array* asArray() const noexcept;
   const Dictionary* asDictionary() const noexcept;
   const std::shared_ptr<Object>* asObject() const noexcept;
@@ -405,6 +443,7 @@ class KIVI_EXPORT Value {
   // A readable rendering for logs and diagnostics (not JSON).
   std::string description() const;
 
+  // Exchanges two values; never allocates.
   void swap(Value& other) noexcept {
     alignas(8) unsigned char t[sizeof(Value)];
     std::memcpy(t, static_cast<void*>(this), sizeof t);
@@ -451,6 +490,7 @@ static_assert(sizeof(Value) == 24);
 // through a const pointer); copying it gives an Array of its own.
 class KIVI_EXPORT Array {
  public:
+  // The member types of a std::vector<Value>.
   using value_type = Value;
   using size_type = std::size_t;
   using difference_type = std::ptrdiff_t;
@@ -463,15 +503,19 @@ class KIVI_EXPORT Array {
   using reverse_iterator = std::reverse_iterator<iterator>;
   using const_reverse_iterator = std::reverse_iterator<const_iterator>;
 
+  // Empty, the given values, or `count` copies of `value` (null markers by default).
   Array() noexcept = default;
   Array(std::initializer_list<Value> values);
   explicit Array(size_type count);
   Array(size_type count, const Value& value);
+  // The elements of [first, last), each made a Value.
   template <class InputIt>
   requires(!std::is_integral_v<InputIt>) Array(InputIt first, InputIt last) {
     for (; first != last; ++first) emplace_back(*first);
   }
+  // Copies the elements into an Array of its own, also from a document's read-only array.
   Array(const Array& other);
+  // Moves; `other` is left empty.
   Array(Array&& other) noexcept
       : data_(other.data_),
         size_(other.size_),
@@ -481,10 +525,12 @@ class KIVI_EXPORT Array {
     other.size_ = other.capacity_ = 0;
     other.borrowed_ = false;
   }
+  // Assignment, of a copy or by moving as the constructors above, and destruction.
   Array& operator=(const Array& other);
   Array& operator=(Array&& other) noexcept;
   ~Array();
 
+  // As std::vector's; resize() adds null markers.
   size_type size() const noexcept { return size_; }
   bool empty() const noexcept { return size_ == 0; }
   size_type capacity() const noexcept { return capacity_; }
@@ -492,6 +538,7 @@ class KIVI_EXPORT Array {
   void clear() noexcept;
   void resize(size_type n);
 
+  // The elements, stored contiguously, as std::vector's.
   Value* data() noexcept { return data_; }
   const Value* data() const noexcept { return data_; }
   iterator begin() noexcept { return data_; }
@@ -505,6 +552,7 @@ class KIVI_EXPORT Array {
   const_reverse_iterator rbegin() const noexcept { return const_reverse_iterator(end()); }
   const_reverse_iterator rend() const noexcept { return const_reverse_iterator(begin()); }
 
+  // Unchecked element access, as std::vector's: `i` must be in range, the array not empty.
   Value& operator[](size_type i) noexcept { return data_[i]; }
   const Value& operator[](size_type i) const noexcept { return data_[i]; }
   Value& front() noexcept { return data_[0]; }
@@ -512,18 +560,21 @@ class KIVI_EXPORT Array {
   Value& back() noexcept { return data_[size_ - 1]; }
   const Value& back() const noexcept { return data_[size_ - 1]; }
 
+  // As std::vector's; a change may invalidate iterators and element pointers.
   void push_back(const Value& value);
   void push_back(Value&& value);
   template <class... Args>
   Value& emplace_back(Args&&... args);
   void pop_back() noexcept;
   iterator insert(const_iterator position, Value value);
+  // Inserts the elements of [first, last) before `position`; returns the first inserted.
   template <class InputIt>
   iterator insert(const_iterator position, InputIt first, InputIt last) {
     const difference_type at = position - begin();
     for (difference_type i = at; first != last; ++first, ++i) insert(begin() + i, Value(*first));
     return begin() + at;
   }
+  // Remove one element or [first, last); return the element after the removed ones.
   iterator erase(const_iterator position);
   iterator erase(const_iterator first, const_iterator last);
 
@@ -543,8 +594,8 @@ class KIVI_EXPORT Array {
 // One member of a Dictionary: `first` is the key, `second` the value, as in a
 // std::map, so `for (const auto& [key, value] : dictionary)` reads the same.
 struct KIVI_EXPORT DictionaryEntry {
-  String first;
-  Value second;
+  String first;  // the key
+  Value second;  // the value
 };
 
 // A dictionary with string keys and the interface of a std::map, kept as an
@@ -552,6 +603,7 @@ struct KIVI_EXPORT DictionaryEntry {
 // until the dictionary is next changed.
 class KIVI_EXPORT Dictionary {
  public:
+  // The member types of a std::map; an entry is a DictionaryEntry.
   using key_type = String;
   using mapped_type = Value;
   using value_type = DictionaryEntry;
@@ -567,6 +619,8 @@ class KIVI_EXPORT Dictionary {
   Dictionary() noexcept = default;
   // Of duplicate keys the first is kept, as std::map does.
   Dictionary(std::initializer_list<DictionaryEntry> entries);
+  // The entries of [first, last), each with `first` and `second`; of duplicate keys the first
+  // is kept.
   template <class InputIt>
   Dictionary(InputIt first, InputIt last) {
     std::vector<DictionaryEntry> entries;
@@ -578,7 +632,9 @@ class KIVI_EXPORT Dictionary {
   explicit Dictionary(std::vector<DictionaryEntry> entries, bool lastWins = false) {
     adopt(std::move(entries), lastWins);
   }
+  // Copies the entries into a Dictionary of its own, also from a document's read-only one.
   Dictionary(const Dictionary& other);
+  // Moves; `other` is left empty.
   Dictionary(Dictionary&& other) noexcept
       : data_(other.data_),
         size_(other.size_),
@@ -588,15 +644,18 @@ class KIVI_EXPORT Dictionary {
     other.size_ = other.capacity_ = 0;
     other.borrowed_ = false;
   }
+  // Assignment, of a copy or by moving as the constructors above, and destruction.
   Dictionary& operator=(const Dictionary& other);
   Dictionary& operator=(Dictionary&& other) noexcept;
   ~Dictionary();
 
+  // The number of entries; reserve() makes room for `n` of them.
   size_type size() const noexcept { return size_; }
   bool empty() const noexcept { return size_ == 0; }
   void clear() noexcept;
   void reserve(size_type n);
 
+  // The entries in key order.
   iterator begin() noexcept { return data_; }
   iterator end() noexcept { return data_ + size_; }
   const_iterator begin() const noexcept { return data_; }
@@ -610,16 +669,20 @@ class KIVI_EXPORT Dictionary {
 
   // The first entry whose key is not less than `key`.
   const_iterator lower_bound(std::string_view key) const noexcept;
+  // The same, for changing the entry's value.
   iterator lower_bound(std::string_view key) noexcept {
     return data_ + (std::as_const(*this).lower_bound(key) - data_);
   }
+  // The entry under `key`, or end().
   const_iterator find(std::string_view key) const noexcept {
     const_iterator it = lower_bound(key);
     return it != end() && it->first == key ? it : end();
   }
+  // The same, for changing the entry's value.
   iterator find(std::string_view key) noexcept {
     return data_ + (std::as_const(*this).find(key) - data_);
   }
+  // Whether an entry has `key`; count() answers 1 or 0.
   size_type count(std::string_view key) const noexcept { return find(key) != end() ? 1 : 0; }
   bool contains(std::string_view key) const noexcept { return find(key) != end(); }
 
@@ -629,26 +692,33 @@ class KIVI_EXPORT Dictionary {
   // key reads as a null Value.
   const Value& at(std::string_view key) const noexcept;
 
+  // Adds `key` with a Value made from `args` (the null marker when none) unless the key is
+  // there; returns the entry under `key` and whether it was added.
   template <class... Args>
   std::pair<iterator, bool> try_emplace(std::string_view key, Args&&... args) {
     iterator it = lower_bound(key);
     if (it != end() && it->first == key) return {it, false};
     return {insertAt(it - data_, String(key), Value(std::forward<Args>(args)...)), true};
   }
+  // try_emplace() with a key of any string type.
   template <class K, class V>
   std::pair<iterator, bool> emplace(K&& key, V&& value) {
     return try_emplace(std::string_view(keyView(key)), std::forward<V>(value));
   }
+  // emplace(); the hint is ignored.
   template <class K, class V>
   iterator emplace_hint(const_iterator, K&& key, V&& value) {
     return emplace(std::forward<K>(key), std::forward<V>(value)).first;
   }
+  // Sets the value under `key`, adding the key when absent; returns the entry and whether it
+  // was added.
   template <class V>
   std::pair<iterator, bool> insert_or_assign(std::string_view key, V&& value) {
     auto [it, inserted] = try_emplace(key);
     it->second = Value(std::forward<V>(value));
     return {it, inserted};
   }
+  // Adds a pair's `first` and `second` unless the key is there, as std::map's.
   template <class Pair>
   requires requires(const Pair& p) {
     p.first;
@@ -657,10 +727,13 @@ class KIVI_EXPORT Dictionary {
   std::pair<iterator, bool> insert(Pair&& entry) {
     return try_emplace(std::string_view(keyView(entry.first)), std::forward<Pair>(entry).second);
   }
+  // insert() of each pair of [first, last).
   template <class InputIt>
   void insert(InputIt first, InputIt last) {
     for (; first != last; ++first) insert(*first);
   }
+  // Remove the entry at `position` (returning the entry after it) or the one under `key`
+  // (returning 1, or 0 when absent).
   iterator erase(const_iterator position);
   size_type erase(std::string_view key);
 

@@ -29,6 +29,7 @@
 
 namespace kivi {
 
+// A point and a span of time on the steady (monotonic) clock, as deadlines and delays use.
 using DispatchTime = std::chrono::steady_clock::time_point;
 using DispatchDuration = std::chrono::steady_clock::duration;
 
@@ -71,6 +72,7 @@ class KIVI_EXPORT DispatchClock : public std::enable_shared_from_this<DispatchCl
   // The steady clock, whose timers fire on the library's own thread.
   static const std::shared_ptr<DispatchClock>& system();
 
+  // The clock's current time.
   virtual DispatchTime now() const = 0;
 
   // A disarmed timer whose handler runs on this clock's firing thread.
@@ -109,9 +111,11 @@ class KIVI_EXPORT DispatchClock : public std::enable_shared_from_this<DispatchCl
 // hour unless given a start.
 class KIVI_EXPORT ManualClock : public DispatchClock {
  public:
+  // A clock at `start`, or at DispatchTime{} plus one hour.
   static std::shared_ptr<ManualClock> create();
   static std::shared_ptr<ManualClock> create(DispatchTime start);
 
+  // The time the clock has been moved to.
   DispatchTime now() const override;
 
   // Moves the clock forward, running on the calling thread the handler of

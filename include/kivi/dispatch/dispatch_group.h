@@ -42,12 +42,15 @@ class KIVI_EXPORT DispatchGroup : public Object {
   DispatchGroup();
   ~DispatchGroup() override;
 
+  // Count one more piece of work under way, or one less (never below zero).
   void enter();
   void leave();
 
+  // Block until the group is empty, or until the deadline `timeout` (then timedOut).
   void wait();
   DispatchTimeoutResult wait(DispatchTime timeout);
 
+  // Hands `block` to `queue` (async) once the group is empty, as described above.
   void notify(const std::shared_ptr<KivDispatchQueueProtocol>& queue, std::function<void()> block);
 
  private:
@@ -55,6 +58,7 @@ class KIVI_EXPORT DispatchGroup : public Object {
   std::unique_ptr<State> state_;
 };
 
+// How groups are held; a null group given to a queue means no group.
 using DispatchGroupPtr = std::shared_ptr<DispatchGroup>;
 
 }  // namespace kivi

@@ -40,11 +40,13 @@ struct KIVI_EXPORT DispatchQoS {
   constexpr DispatchQoS(QoSClass cls, int priority = 0) noexcept
       : qosClass(cls), relativePriority(std::clamp(priority, kMinRelativePriority, 0)) {}
 
+  // The class, and the relative priority within it (-15…0); unspecified and 0 by default.
   QoSClass qosClass = QoSClass::unspecified;
   int relativePriority = 0;
 
   friend constexpr bool operator==(const DispatchQoS&, const DispatchQoS&) = default;
 
+  // Each class at relative priority 0.
   static const DispatchQoS userInteractive;
   static const DispatchQoS userInitiated;
   static const DispatchQoS default_;
@@ -64,11 +66,14 @@ inline constexpr DispatchQoS DispatchQoS::unspecified{QoSClass::unspecified};
 // queue does (see DispatchQueue); the others are accepted and kept with the
 // work item, since the pool has neither priorities nor per-thread contexts.
 struct KIVI_EXPORT DispatchWorkItemFlags {
+  // The bits; 0 (the default) is no flag.
   std::uint64_t rawValue = 0;
 
+  // Whether every flag of `other` is set.
   constexpr bool contains(DispatchWorkItemFlags other) const noexcept {
     return (rawValue & other.rawValue) == other.rawValue;
   }
+  // Whether no flag is set; `|` combines flags.
   constexpr bool empty() const noexcept { return rawValue == 0; }
   friend constexpr DispatchWorkItemFlags operator|(DispatchWorkItemFlags a,
                                                    DispatchWorkItemFlags b) noexcept {
@@ -76,6 +81,9 @@ struct KIVI_EXPORT DispatchWorkItemFlags {
   }
   friend constexpr bool operator==(DispatchWorkItemFlags, DispatchWorkItemFlags) = default;
 
+  // The flags. On a private concurrent queue barrier work runs alone, after the work given
+  // before it and before the work given after it (see DispatchQueue); the others change
+  // nothing here.
   static const DispatchWorkItemFlags barrier;
   static const DispatchWorkItemFlags detached;
   static const DispatchWorkItemFlags assignCurrentContext;
@@ -91,6 +99,7 @@ inline constexpr DispatchWorkItemFlags DispatchWorkItemFlags::noQoS{0x08};
 inline constexpr DispatchWorkItemFlags DispatchWorkItemFlags::inheritQoS{0x10};
 inline constexpr DispatchWorkItemFlags DispatchWorkItemFlags::enforceQoS{0x20};
 
+// How a wait with a time-out ended: success, or timedOut when the deadline came first.
 enum class DispatchTimeoutResult : std::uint8_t { success, timedOut };
 
 }  // namespace kivi

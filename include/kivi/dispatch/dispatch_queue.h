@@ -72,8 +72,11 @@ struct DispatchQueueCore;
 
 class KIVI_EXPORT DispatchQueue : public Object, public KivDispatchQueueProtocol {
  public:
+  // Whether a private queue runs its work one item at a time or side by side.
   enum class Attributes : std::uint8_t { serial, concurrent };
 
+  // A private queue named `label`, serial unless asked otherwise; `qos` is recorded for qos()
+  // (unspecified when not given).
   [[nodiscard]] static std::shared_ptr<DispatchQueue> create(
       std::string label, Attributes attributes = Attributes::serial);
   [[nodiscard]] static std::shared_ptr<DispatchQueue> create(std::string label, DispatchQoS qos,
@@ -84,8 +87,11 @@ class KIVI_EXPORT DispatchQueue : public Object, public KivDispatchQueueProtocol
   static const std::shared_ptr<DispatchQueue>& global();
   // The process-wide concurrent queue of `qos`.
   static const std::shared_ptr<DispatchQueue>& global(DispatchQoS::QoSClass qos);
+
   ~DispatchQueue() override;
 
+  // The label given at creation ("kivi.main", "kivi.global.utility" and the like for the
+  // process's queues), whether the queue is serial, and its quality of service.
   const std::string& label() const noexcept;
   bool isSerial() const noexcept;
   DispatchQoS qos() const noexcept;
@@ -94,16 +100,21 @@ class KIVI_EXPORT DispatchQueue : public Object, public KivDispatchQueueProtocol
   using KivDispatchQueueProtocol::asyncAfter;
   using KivDispatchQueueProtocol::sync;
 
+  // Submit work, or a work item run through its perform(), as described above; in `group`
+  // when one is given. The quality of service is not acted on.
   void async(std::function<void()> work);
   void async(const DispatchGroupPtr& group, DispatchQoS qos, DispatchWorkItemFlags flags,
              std::function<void()> work) override;
   void async(const DispatchWorkItemPtr& workItem) override;
   void async(const DispatchGroupPtr& group, const DispatchWorkItemPtr& workItem) override;
 
+  // Run the work or the work item on the calling thread in the queue's order, as described
+  // above; return once it has run.
   void sync(const std::function<void()>& work) override;
   void sync(const DispatchWorkItemPtr& workItem) override;
 
-  // Submits the work with async() once `deadline` has passed on the clock.
+  // Submits the work with async() once `deadline` has passed on the clock (the system clock
+  // unless `clock` is given).
   void asyncAfter(DispatchTime deadline, std::function<void()> work);
   void asyncAfter(DispatchClock& clock, DispatchTime deadline, std::function<void()> work);
   void asyncAfter(DispatchTime deadline, DispatchQoS qos, DispatchWorkItemFlags flags,
@@ -123,6 +134,7 @@ class KIVI_EXPORT DispatchQueue : public Object, public KivDispatchQueueProtocol
   std::shared_ptr<detail::DispatchQueueCore> core_;
 };
 
+// How dispatch queues are held.
 using DispatchQueuePtr = std::shared_ptr<DispatchQueue>;
 
 }  // namespace kivi

@@ -38,9 +38,12 @@ class KivDispatchQueueProtocol;
 
 class KIVI_EXPORT DispatchWorkItem : public Object {
  public:
+  // An item that runs `block`, with `flags` (none by default) and `qos` (unspecified by
+  // default) kept for the queue.
   explicit DispatchWorkItem(std::function<void()> block);
   DispatchWorkItem(DispatchWorkItemFlags flags, std::function<void()> block);
   DispatchWorkItem(DispatchQoS qos, DispatchWorkItemFlags flags, std::function<void()> block);
+
   ~DispatchWorkItem() override;
 
   // Runs the block on the calling thread unless the item is cancelled, then
@@ -60,6 +63,7 @@ class KIVI_EXPORT DispatchWorkItem : public Object {
   void cancel() noexcept;
   bool isCancelled() const noexcept;
 
+  // The quality of service and the flags given at creation.
   DispatchQoS qos() const noexcept;
   DispatchWorkItemFlags flags() const noexcept;
 
@@ -68,6 +72,7 @@ class KIVI_EXPORT DispatchWorkItem : public Object {
   std::unique_ptr<State> state_;
 };
 
+// How work items are held.
 using DispatchWorkItemPtr = std::shared_ptr<DispatchWorkItem>;
 
 }  // namespace kivi

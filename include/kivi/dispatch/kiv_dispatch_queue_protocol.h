@@ -46,49 +46,64 @@ class KIVI_EXPORT KivDispatchQueueProtocol {
   virtual ~KivDispatchQueueProtocol() = default;
 
   // The requirements.
+
+  // Submits `work` to run on the queue, in `group` (entered now, left after the work has run)
+  // unless it is null.
   virtual void async(const DispatchGroupPtr& group, DispatchQoS qos, DispatchWorkItemFlags flags,
                      std::function<void()> work) = 0;
+  // Runs the work item on the calling thread in the queue's order; returns once it has run.
   virtual void sync(const DispatchWorkItemPtr& workItem) = 0;
   // The global queue of `qos`: DispatchQueue::global(qos).
   static std::shared_ptr<DispatchQueue> global(DispatchQoS::QoSClass qos);
+  // Submit a work item, run through its perform(), in `group` unless it is null.
   virtual void async(const DispatchWorkItemPtr& workItem) = 0;
   virtual void async(const DispatchGroupPtr& group, const DispatchWorkItemPtr& workItem) = 0;
+  // Submit the work or the work item with async() once `deadline` has passed.
   virtual void asyncAfter(DispatchTime deadline, DispatchQoS qos, DispatchWorkItemFlags flags,
                           std::function<void()> work) = 0;
   virtual void asyncAfter(DispatchTime deadline, const DispatchWorkItemPtr& workItem) = 0;
-  // `work` is not kept beyond the call.
+  // Runs `work` on the calling thread in the queue's order; returns once it has run. `work` is
+  // not kept beyond the call.
   virtual void sync(const std::function<void()>& work) = 0;
 
-  // async(group:qos:flags:execute:) with the arguments left out defaulted.
+  // The four-argument async() with what is left out defaulted: no group, unspecified quality
+  // of service, no flags.
   void async(std::function<void()> work) { async(nullptr, {}, {}, std::move(work)); }
+  // async() with `group`; unspecified quality of service, no flags.
   void async(const DispatchGroupPtr& group, std::function<void()> work) {
     async(group, {}, {}, std::move(work));
   }
+  // async() with `qos`; no group, no flags.
   void async(DispatchQoS qos, std::function<void()> work) {
     async(nullptr, qos, {}, std::move(work));
   }
+  // async() with `flags`; no group, unspecified quality of service.
   void async(DispatchWorkItemFlags flags, std::function<void()> work) {
     async(nullptr, {}, flags, std::move(work));
   }
+  // async() with `qos` and `flags`; no group.
   void async(DispatchQoS qos, DispatchWorkItemFlags flags, std::function<void()> work) {
     async(nullptr, qos, flags, std::move(work));
   }
+  // async() with `group` and `qos`; no flags.
   void async(const DispatchGroupPtr& group, DispatchQoS qos, std::function<void()> work) {
     async(group, qos, {}, std::move(work));
   }
+  // async() with `group` and `flags`; unspecified quality of service.
   void async(const DispatchGroupPtr& group, DispatchWorkItemFlags flags,
              std::function<void()> work) {
     async(group, {}, flags, std::move(work));
   }
 
-  // asyncAfter(deadline:qos:flags:execute:) with the arguments left out
-  // defaulted.
+  // The four-argument asyncAfter() with unspecified quality of service and no flags.
   void asyncAfter(DispatchTime deadline, std::function<void()> work) {
     asyncAfter(deadline, {}, {}, std::move(work));
   }
+  // asyncAfter() with `qos`; no flags.
   void asyncAfter(DispatchTime deadline, DispatchQoS qos, std::function<void()> work) {
     asyncAfter(deadline, qos, {}, std::move(work));
   }
+  // asyncAfter() with `flags`; unspecified quality of service.
   void asyncAfter(DispatchTime deadline, DispatchWorkItemFlags flags, std::function<void()> work) {
     asyncAfter(deadline, {}, flags, std::move(work));
   }

@@ -47,6 +47,7 @@ inline constexpr std::size_t kOperationStateSize = 272;
 }  // namespace detail
 
 class Operation;
+// How operations are held: to be queued, have dependents or be observed.
 using OperationPtr = std::shared_ptr<Operation>;
 
 class KIVI_EXPORT Operation : public Object {
@@ -66,6 +67,9 @@ class KIVI_EXPORT Operation : public Object {
   // announces "isReady": a cancelled operation is ready.
   virtual void cancel();
 
+  // The state. isCancelled(): cancel() was called. The base isExecuting() and isFinished()
+  // follow the base start(); isAsynchronous() is false unless overridden, and isConcurrent()
+  // answers the same. isReady() is described above.
   virtual bool isCancelled() const;
   virtual bool isExecuting() const;
   virtual bool isFinished() const;
@@ -79,9 +83,11 @@ class KIVI_EXPORT Operation : public Object {
   void removeDependency(const OperationPtr& operation);
   [[nodiscard]] std::vector<OperationPtr> dependencies() const;
 
+  // Run on a worker thread once the operation has finished, then cleared; empty by default.
   [[nodiscard]] std::function<void()> completionBlock() const;
   void setCompletionBlock(std::function<void()> block);
 
+  // A name for debugging, empty by default; setName() announces "name".
   [[nodiscard]] std::string name() const;
   void setName(std::string name);
 
@@ -111,6 +117,7 @@ class KIVI_EXPORT Operation : public Object {
 // An operation whose work is a function.
 class KIVI_EXPORT BlockOperation : public Operation {
  public:
+  // `block` is the work: main() calls it (an empty one does nothing).
   explicit BlockOperation(std::function<void()> block) : block_(std::move(block)) {}
   void main() override;
   std::string className() const override { return "NSBlockOperation"; }

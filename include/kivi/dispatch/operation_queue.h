@@ -45,6 +45,7 @@ namespace detail {
 struct QueueCore;
 }
 
+// The default maxConcurrentOperationCount: the queue decides.
 inline constexpr std::int64_t OperationQueueDefaultMaxConcurrentOperationCount = -1;
 
 class KIVI_EXPORT OperationQueue : public Object, public OperationQueueProtocol {
@@ -58,10 +59,16 @@ class KIVI_EXPORT OperationQueue : public Object, public OperationQueueProtocol 
   std::string description() const override { return Object::description(); }
   std::string className() const override { return "NSOperationQueue"; }
 
+  // Adds an operation (refused ones as described above); it starts when its turn comes.
   void addOperation(const OperationPtr& operation) override;
+  // Adds each operation; with `waitUntilFinished`, blocks until all those accepted have
+  // finished and left the queue.
   void addOperations(const std::vector<OperationPtr>& operations, bool waitUntilFinished) override;
+  // Adds a BlockOperation running `block`.
   void addOperationWithBlock(std::function<void()> block);
+  // Calls cancel() on each operation the queue holds; they still leave it by finishing.
   void cancelAllOperations() override;
+  // Blocks until the queue holds no operation, also those added meanwhile.
   void waitUntilAllOperationsAreFinished() override;
 
   void addObserver(const std::shared_ptr<Object>& observer, std::string_view keyPath,
@@ -73,14 +80,17 @@ class KIVI_EXPORT OperationQueue : public Object, public OperationQueueProtocol 
   }
   using Object::removeObserver;
 
+  // How many operations may execute at once; see above for -1, 0 and other negatives.
   std::int64_t maxConcurrentOperationCount() const override;
   void setMaxConcurrentOperationCount(std::int64_t count) override;
+  // A name for debugging, empty by default.
   std::string name() const override;
   void setName(std::string name) override;
+  // The operations the queue holds, waiting or executing (a copy of the list), and their number.
   [[nodiscard]] std::vector<OperationPtr> operations() const override;
   std::uint64_t operationCount() const override;
 
-  // A suspended queue starts nothing new.
+  // A suspended queue starts nothing new; setSuspended() announces "isSuspended".
   bool isSuspended() const;
   void setSuspended(bool suspended);
 

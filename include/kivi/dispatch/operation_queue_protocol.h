@@ -21,6 +21,7 @@
 namespace kivi {
 
 class Operation;
+// How operations are held: to be queued, have dependents or be observed.
 using OperationPtr = std::shared_ptr<Operation>;
 
 class KIVI_EXPORT OperationQueueProtocol {
@@ -30,6 +31,7 @@ class KIVI_EXPORT OperationQueueProtocol {
   // The base object interface.
   virtual std::string description() const = 0;
 
+  // OperationQueue's members of the same names.
   virtual void addOperation(const OperationPtr& operation) = 0;
   virtual void addOperations(const std::vector<OperationPtr>& operations,
                              bool waitUntilFinished) = 0;
@@ -39,12 +41,14 @@ class KIVI_EXPORT OperationQueueProtocol {
                            KeyValueObservingOptions options, void* context) = 0;
   virtual void removeObserver(const Object* observer, std::string_view keyPath) = 0;
 
+  // OperationQueue's members of the same names.
   virtual std::int64_t maxConcurrentOperationCount() const = 0;
   virtual void setMaxConcurrentOperationCount(std::int64_t count) = 0;
   virtual std::string name() const = 0;
   virtual void setName(std::string name) = 0;
   // A copy of the list of operations in the queue.
   virtual std::vector<OperationPtr> operations() const = 0;
+  // How many operations are in the queue.
   virtual std::uint64_t operationCount() const = 0;
 };
 

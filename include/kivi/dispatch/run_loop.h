@@ -51,6 +51,7 @@
 namespace kivi {
 
 class RunLoop;
+// How run loops are held.
 using RunLoopPtr = std::shared_ptr<RunLoop>;
 
 class KIVI_EXPORT RunLoop : public Object, public KivNSRunLoopProtocol {
@@ -80,6 +81,8 @@ class KIVI_EXPORT RunLoop : public Object, public KivNSRunLoopProtocol {
   void performInModes(const std::vector<RunLoopMode>& modes, std::function<void()> block) {
     perform(modes, std::move(block));
   }
+  // performBlock() is performInModes() for the common modes; the perform() overloads are the
+  // protocol's names for the two.
   void performBlock(std::function<void()> block) { perform(std::move(block)); }
   void perform(const std::vector<RunLoopMode>& modes, std::function<void()> block) override;
   void perform(std::function<void()> block) override;

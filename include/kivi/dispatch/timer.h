@@ -30,6 +30,7 @@
 namespace kivi {
 
 class Timer;
+// How timers are held; a run loop holds those added to it until they are invalidated.
 using TimerPtr = std::shared_ptr<Timer>;
 
 namespace detail {
@@ -38,6 +39,7 @@ struct TimerCore;
 
 class KIVI_EXPORT Timer : public Object {
  public:
+  // The timer's work; it is given the timer that fires.
   using Block = std::function<void(const TimerPtr& timer)>;
 
   // timerWithTimeInterval:repeats:block: — first due `interval` from now; not

@@ -36,21 +36,34 @@ class KIVI_EXPORT MockDispatchQueue : public Object, public KivDispatchQueueProt
  public:
   MockDispatchQueue() = default;
 
+  // Called by async(group, qos, flags, work), and so by the protocol's shorter async() forms;
+  // without it the work never runs.
   std::function<void(const DispatchGroupPtr&, DispatchQoS, DispatchWorkItemFlags,
                      std::function<void()>)>
       asyncBlock;
+  // Called by async(group, workItem); without it the item never runs.
   std::function<void(const DispatchGroupPtr&, const DispatchWorkItemPtr&)> asyncWithGroupBlock;
+  // Called by async(workItem); without it the item never runs.
   std::function<void(const DispatchWorkItemPtr&)> asyncWithWorkItemBlock;
+  // Called by asyncAfter(deadline, qos, flags, work), and so by the protocol's shorter asyncAfter()
+  // forms; without it the work never runs.
   std::function<void(DispatchTime, DispatchQoS, DispatchWorkItemFlags, std::function<void()>)>
       asyncAfterBlock;
+  // Called by asyncAfter(deadline, workItem); without it the item never runs.
   std::function<void(DispatchTime, const DispatchWorkItemPtr&)> asyncAfterWithWorkItemBlock;
+  // Called by sync(workItem); without it the item does not run.
   std::function<void(const DispatchWorkItemPtr&)> syncWithWorkItemBlock;
+  // Called by sync(work); without it the work does not run.
   std::function<void(const std::function<void()>&)> syncBlock;
   // Class-level: answers global(qos) for every MockDispatchQueue user.
   static std::function<DispatchQueuePtr(DispatchQoS::QoSClass)> globalQueuewithQOSBlock;
 
+  // The answer of globalQueuewithQOSBlock for `qos`; without it, a new serial queue labelled
+  // "MockQueue".
   static DispatchQueuePtr global(DispatchQoS::QoSClass qos);
 
+  // The protocol's overloads not overridden here stay reachable: the shorter
+  // async() and asyncAfter() forms, which end in the callbacks above.
   using KivDispatchQueueProtocol::async;
   using KivDispatchQueueProtocol::asyncAfter;
   using KivDispatchQueueProtocol::sync;

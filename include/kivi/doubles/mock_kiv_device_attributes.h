@@ -25,6 +25,7 @@ class KIVI_EXPORT MockKivDeviceAttributes : public Object, public KivDeviceAttri
  public:
   MockKivDeviceAttributes() = default;
 
+  // Answers getMacHardwareSerialNumber(); without it, nullopt.
   std::function<std::optional<std::string>()> getMacHardwareSerialNumberBlock;
 
   std::optional<std::string> getMacHardwareSerialNumber() override;

@@ -26,6 +26,7 @@ class KIVI_EXPORT MockKivFeatureFlagProvider : public Object,
  public:
   MockKivFeatureFlagProvider() = default;
 
+  // Answers valueForFeatureFlagWithServiceName(serviceName, featureFlagName); without it, true.
   std::function<bool(const std::string&, const std::string&)> valueForFeatureFlagBlock;
 
   std::string description() const override { return Object::description(); }

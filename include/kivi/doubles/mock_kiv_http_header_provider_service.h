@@ -20,13 +20,16 @@ namespace kivi {
 class KIVI_EXPORT MockKivHttpHeaderProviderService : public Object,
                                                      public KivHttpHeaderProviderServiceProtocol {
  public:
+  // With both maps empty, or with the maps given.
   MockKivHttpHeaderProviderService() = default;
   MockKivHttpHeaderProviderService(StringDictionary httpMonitoringHeaders,
                                    StringDictionary uniqueTransactionIdHeader)
       : httpMonitoringHeadersInternal(std::move(httpMonitoringHeaders)),
         uniqueTransactionIdHeaderInternal(std::move(uniqueTransactionIdHeader)) {}
 
+  // What httpMonitoringHeaders() answers.
   StringDictionary httpMonitoringHeadersInternal;
+  // What uniqueTransactionIdHeader() answers.
   StringDictionary uniqueTransactionIdHeaderInternal;
 
   StringDictionary httpMonitoringHeaders() override { return httpMonitoringHeadersInternal; }

@@ -28,8 +28,12 @@ class KIVI_EXPORT MockKivNSAlert : public Object, public KivNSAlertProtocol {
  public:
   MockKivNSAlert() = default;
 
+  // Answers runModal(); without it, NSModalResponseContinue.
   std::function<NSModalResponse()> runModalCallback;
+  // Answers addButtonWithTitle(title); without it, null.
   std::function<std::shared_ptr<NSButton>(const std::string&)> addButtonCallback;
+  // Called by beginSheetModalForWindow(window, completionHandler); without it the completion is
+  // never called.
   std::function<void(const std::shared_ptr<NSWindow>&, std::function<void(NSModalResponse)>)>
       beginSheetModalCallback;
 

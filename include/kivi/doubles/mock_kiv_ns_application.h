@@ -25,7 +25,9 @@ class KIVI_EXPORT MockKivNSApplication : public Object, public KivNSApplicationP
  public:
   MockKivNSApplication() = default;
 
+  // Called by activateIgnoringOtherApps(flag); without it nothing happens.
   std::function<void(bool)> activateIgnoringOtherAppsBlock;
+  // Called by terminate(sender); without it nothing happens.
   std::function<void(const ObjectPtr&)> terminateAppBlock;
 
   void activateIgnoringOtherApps(bool flag) override {

@@ -31,9 +31,13 @@ class KIVI_EXPORT MockKivNSBundle : public Object, public KivNSBundleProtocol {
  public:
   MockKivNSBundle() = default;
 
+  // Answers objectForInfoDictionaryKey(key); without it, the null marker.
   std::function<Value(const std::string&)> infoDictionaryObjectForKeyBlock;
+  // Answers bundleIdentifier(); without it, nullopt.
   std::function<std::optional<std::string>()> bundleIdentifierBlock;
+  // Answers executableArchitectures(); without it, nullopt.
   std::function<std::optional<std::vector<std::int64_t>>()> executableArchitecturesBlock;
+  // Answers bundlePath(); without it, "".
   std::function<std::string()> bundlePathBlock;
 
   std::optional<std::string> bundleIdentifier() override {

@@ -28,12 +28,19 @@ class KIVI_EXPORT MockKivNSDistributedLock : public Object, public KivNSDistribu
  public:
   MockKivNSDistributedLock() = default;
 
+  // Answers tryLock(); without it, true.
   std::function<bool()> tryLockBlock;
+  // Answers tryLock(timeout); without it, true.
   std::function<bool(double)> tryLockWithTimeOutBlock;
+  // Answers tryLock(timeout, resolution); without it, true.
   std::function<bool(double, double)> tryLockWithTimeOutAndResolutionBlock;
+  // Called by tryLock(timeout, protectedBlock); without it the protected block never runs.
   std::function<void(double, std::function<void(bool)>)> tryLockWithTimeOutAndProtectedBlock;
+  // Called by tryLock(protectedBlock); without it the protected block never runs.
   std::function<void(std::function<void(bool)>)> tryLockWithProtectedBlock;
+  // Called by unlock(); without it nothing happens.
   std::function<void()> unlockBlock;
+  // Called by breakLock(); without it nothing happens.
   std::function<void()> breakLockBlock;
 
   [[nodiscard]] bool tryLock() override;

@@ -37,22 +37,31 @@ class KIVI_EXPORT MockKivNSDistributedNotificationCenter
  public:
   MockKivNSDistributedNotificationCenter() = default;
 
+  // Called by postNotificationName(name, object, userInfo, deliverImmediately); without it nothing
+  // is posted.
   std::function<void(const NSNotificationName&, const std::string&, const Dictionary&, bool)>
       postNotificationImmediatelyBlock;
+  // Called by postNotificationName(name, object, userInfo, options); without it nothing is posted.
   std::function<void(const NSNotificationName&, const std::string&, const Dictionary&,
                      NSDistributedNotificationOptions)>
       postNotificationWithOptionsBlock;
+  // Called by addObserver(observer, selector, name, object, suspensionBehavior); without it nothing
+  // is registered.
   std::function<void(const ObjectPtr&, const Selector&, const NSNotificationName&,
                      const std::string&, NSNotificationSuspensionBehavior)>
       addDistributedNotificationSuspensionBehaviourObserverBlock;
+  // Called by addObserver(observer, selector, name, object), in both forms; without it nothing is
+  // registered.
   std::function<void(const ObjectPtr&, const Selector&, const NSNotificationName&,
                      const std::string&)>
       addDistributedNotificationObserverBlock;
+  // Called by removeObserver(observer, name, object), in both forms; without it nothing happens.
   std::function<void(const ObjectPtr&, const NSNotificationName&, const std::string&)>
       removeDistributedNotificationObserverBlock;
 
   std::string description() const override { return Object::description(); }
 
+  // The in-process operations stay reachable beside the distributed ones.
   using MockKivNSNotificationCenter::addObserver;
   using MockKivNSNotificationCenter::postNotificationName;
   using MockKivNSNotificationCenter::removeObserver;
@@ -91,12 +100,14 @@ class KIVI_EXPORT MockKivNSDistributedNotificationCenter
     }
   }
 
-  // The in-process forms of the two shared operations, answered by this
-  // double's own callbacks.
+  // The in-process form: goes to addDistributedNotificationObserverBlock, the
+  // object as a string ("" for null, else its description()).
   void addObserver(const ObjectPtr& observer, const Selector& selector,
                    const NSNotificationName& name, const ObjectPtr& object) override {
     addObserver(observer, selector, name, objectName(object));
   }
+  // The in-process form: goes to removeDistributedNotificationObserverBlock,
+  // the object as a string ("" for null, else its description()).
   void removeObserver(const ObjectPtr& observer, const NSNotificationName& name,
                       const ObjectPtr& object) override {
     removeObserver(observer, name, objectName(object));

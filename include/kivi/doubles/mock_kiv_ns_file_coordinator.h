@@ -29,20 +29,30 @@ class KIVI_EXPORT MockKivNSFileCoordinator : public Object, public KivNSFileCoor
  public:
   MockKivNSFileCoordinator() = default;
 
+  // Called by coordinateReadingItemAtURL(url, options, error, accessor); without it the accessor
+  // never runs.
   std::function<void(const URLPtr&, NSFileCoordinatorReadingOptions, ErrorPtr*,
                      std::function<void(const URLPtr&)>)>
       coordinateReadingItemAtURLImplementationBlock;
+  // Called by coordinateWritingItemAtURL(url, options, error, accessor); without it the accessor
+  // never runs.
   std::function<void(const URLPtr&, NSFileCoordinatorWritingOptions, ErrorPtr*,
                      std::function<void(const URLPtr&)>)>
       coordinateWritingItemAtURLBlock;
+  // Called by coordinateReadingItemAtURL(readingURL, readingOptions, writingURL, writingOptions,
+  // error, accessor); without it the accessor never runs.
   std::function<void(const URLPtr&, NSFileCoordinatorReadingOptions, const URLPtr&,
                      NSFileCoordinatorWritingOptions, ErrorPtr*,
                      std::function<void(const URLPtr&, const URLPtr&)>)>
       coordinateReadWriteItemAtURLBlock;
+  // Called by coordinateWritingItemAtURL(url1, options1, url2, options2, error, accessor); without
+  // it the accessor never runs.
   std::function<void(const URLPtr&, NSFileCoordinatorWritingOptions, const URLPtr&,
                      NSFileCoordinatorWritingOptions, ErrorPtr*,
                      std::function<void(const URLPtr&, const URLPtr&)>)>
       coordinateWriteItemsAtMultipleURLsBlock;
+  // Called by coordinateAccessWithIntents(intents, queue, accessor); without it the accessor never
+  // runs.
   std::function<void(const std::vector<NSFileAccessIntent>&, const std::shared_ptr<OperationQueue>&,
                      std::function<void(const ErrorPtr&)>)>
       coordinateAsynchronousFileOperationsBlock;

@@ -26,7 +26,9 @@ class KIVI_EXPORT MockKivNSFileHandle : public Object, public KivNSFileHandlePro
  public:
   MockKivNSFileHandle() = default;
 
+  // Called by closeFile(); without it nothing happens.
   std::function<void()> closeFileBlock;
+  // Called by writeData(data); without it the data goes nowhere.
   std::function<void(const Data&)> writeDataBlock;
 
   void closeFile() override {

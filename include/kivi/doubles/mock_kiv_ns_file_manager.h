@@ -32,34 +32,56 @@ class KIVI_EXPORT MockKivNSFileManager : public Object, public KivNSFileManagerP
  public:
   MockKivNSFileManager() = default;
 
+  // Answers fileExistsAtPath(path); without it, false.
   std::function<bool(const std::string&)> fileExistsAtPathBlock;
+  // Answers fileExistsAtPath(path, isDirectory) and sets `*isDirectory` itself; without it, false.
   std::function<bool(const std::string&, bool*)> fileExistsAtPathIsDirectoryBlock;
+  // Answers moveItemAtURL(srcURL, dstURL, error); without it, false.
   std::function<bool(const URLPtr&, const URLPtr&, ErrorPtr*)> moveItemAtURLBlock;
+  // Answers moveItemAtPath(srcPath, dstPath, error); without it, false.
   std::function<bool(const std::string&, const std::string&, ErrorPtr*)> moveItemAtPathBlock;
+  // Answers copyItemAtURL(srcURL, dstURL, error); without it, false.
   std::function<bool(const URLPtr&, const URLPtr&, ErrorPtr*)> copyItemAtURLBlock;
+  // Answers copyItemAtPath(srcPath, dstPath, error); without it, false.
   std::function<bool(const std::string&, const std::string&, ErrorPtr*)> copyItemAtPathBlock;
+  // Answers removeItemAtURL(url, error); without it, false.
   std::function<bool(const URLPtr&, ErrorPtr*)> removeItemAtURLBlock;
+  // Answers removeItemAtPath(path, error); without it, false.
   std::function<bool(const std::string&, ErrorPtr*)> removeItemAtPathBlock;
+  // Answers contentsOfDirectoryAtPath(path, error); without it, an empty list.
   std::function<std::vector<std::string>(const std::string&, ErrorPtr*)>
       contentsOfDirectoryAtPathBlock;
+  // Answers contentsAtPath(path); without it, empty data.
   std::function<Data(const std::string&)> contentsAtPathBlock;
+  // Answers contentsOfDirectoryAtURL(url, keys, options, error); without it, an empty list.
   std::function<std::vector<URLPtr>(const URLPtr&, const std::vector<std::string>&,
                                     NSDirectoryEnumerationOptions, ErrorPtr*)>
       contentsOfDirectoryAtURLBlock;
+  // Answers createDirectoryAtURL(url, createIntermediates, attributes, error); without it, false.
   std::function<bool(const URLPtr&, bool, const Dictionary&, ErrorPtr*)> createDirectoryAtURLBlock;
+  // Answers createDirectoryAtPath(path, createIntermediates, attributes, error); without it, false.
   std::function<bool(const std::string&, bool, const Dictionary&, ErrorPtr*)>
       createDirectoryAtPathBlock;
+  // Answers createFileAtPath(path, contents, attributes); without it, false.
   std::function<bool(const std::string&, const Data&, const Dictionary&)> createFileAtPathBlock;
+  // Answers URLsForDirectory(directory, domains); without it, an empty list.
   std::function<std::vector<URLPtr>(NSSearchPathDirectory, NSSearchPathDomainMask)>
       urlsForDirectoryAndDomainBlock;
+  // Answers attributesOfItemAtPath(path, error); without it, an empty map.
   std::function<Dictionary(const std::string&, ErrorPtr*)> attributesOfItemAtPathBlock;
+  // Answers URLForDirectory(directory, domain, appropriateForURL, create, error); without it, null.
   std::function<URLPtr(NSSearchPathDirectory, NSSearchPathDomainMask, const URLPtr&, bool,
                        ErrorPtr*)>
       urlForDirectoryBlock;
+  // Answers homeDirectoryForUser(userName); without it, null.
   std::function<URLPtr(const std::string&)> homeDirectoryForUserBlock;
+  // Answers linkItemAtPath(srcPath, dstPath, error); without it, false.
   std::function<bool(const std::string&, const std::string&, ErrorPtr*)> linkItemAtPathBlock;
+  // Answers displayNameAtPath(path); without it, "Mock display name".
   std::function<std::string(const std::string&)> displayNameAtPathBlock;
+  // Answers destinationOfSymbolicLinkAtPath(path); without it, "".
   std::function<std::string(const std::string&)> destinationOfSymbolicLinkBlock;
+  // Answers containerURLForSecurityApplicationGroupIdentifier(groupIdentifier); without it, null.
   std::function<URLPtr(const std::string&)> containerURLForSecurityApplicationGroupIdentifierBlock;
   // What temporaryDirectory() answers; null: the real temporary directory.
   URLPtr temporaryDirectoryURL;

@@ -32,16 +32,23 @@ class KIVI_EXPORT MockKivNSHTTPCookieStorage : public Object,
  public:
   MockKivNSHTTPCookieStorage() = default;
 
+  // Answers cookiesForURL(url); without it, an empty list.
   std::function<std::vector<HTTPCookiePtr>(const URLPtr&)> cookiesForURLBlock;
+  // Called by removeCookiesSinceDate(date); without it nothing is removed.
   std::function<void(Date)> removeCookiesSinceDateBlock;
+  // Called by setCookies(cookies, url, mainDocumentURL); without it nothing is stored.
   std::function<void(const std::vector<HTTPCookiePtr>&, const URLPtr&, const URLPtr&)>
       setCookiesWithMainDocumentURLBlock;
+  // The stored cookies, in the order of insertion.
   std::vector<HTTPCookiePtr> internalCookies;
 
   std::string description() const override { return Object::description(); }
 
+  // Appends `cookie` to internalCookies, even when an equal one is there.
   void setCookie(const HTTPCookiePtr& cookie) override { internalCookies.push_back(cookie); }
+  // Removes from internalCookies every cookie equal to `cookie`.
   void deleteCookie(const HTTPCookiePtr& cookie) override;
+  // Goes to setCookiesWithMainDocumentURLBlock; internalCookies stay as they are.
   void setCookies(const std::vector<HTTPCookiePtr>& cookies, const URLPtr& url,
                   const URLPtr& mainDocumentURL) override {
     if (setCookiesWithMainDocumentURLBlock) {

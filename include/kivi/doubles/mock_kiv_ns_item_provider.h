@@ -29,9 +29,13 @@ class KIVI_EXPORT MockKivNSItemProvider : public Object, public KivNSItemProvide
  public:
   MockKivNSItemProvider() = default;
 
+  // Answers loadFileRepresentationForTypeIdentifier(typeIdentifier, completionHandler); without it,
+  // a new progress and the completion is never called.
   std::function<NSProgressPtr(const std::string&,
                               std::function<void(const URLPtr&, const ErrorPtr&)>)>
       loadFileRepresentationBlock;
+  // Answers loadObjectOfClass(aClass, completionHandler); without it, a new progress and the
+  // completion is never called.
   std::function<NSProgressPtr(
       const NSItemProviderReadingClass&,
       std::function<void(const NSItemProviderReadingPtr&, const ErrorPtr&)>)>
@@ -39,6 +43,8 @@ class KIVI_EXPORT MockKivNSItemProvider : public Object, public KivNSItemProvide
 
   std::string description() const override { return Object::description(); }
 
+  // Loads the item's data of `typeIdentifier` as a file; here, hands both arguments to
+  // loadFileRepresentationBlock.
   NSProgressPtr loadFileRepresentationForTypeIdentifier(
       const std::string& typeIdentifier,
       std::function<void(const URLPtr&, const ErrorPtr&)> completionHandler) override {
@@ -47,6 +53,8 @@ class KIVI_EXPORT MockKivNSItemProvider : public Object, public KivNSItemProvide
     }
     return std::make_shared<NSProgress>(0);
   }
+  // Makes an object of `aClass` from the item's data; here, hands both arguments to
+  // loadObjectOfClassBlock.
   NSProgressPtr loadObjectOfClass(
       const NSItemProviderReadingClass& aClass,
       std::function<void(const NSItemProviderReadingPtr&, const ErrorPtr&)> completionHandler)

@@ -31,18 +31,26 @@ class KIVI_EXPORT MockKivNSNotificationCenter : public Object,
  public:
   MockKivNSNotificationCenter() = default;
 
+  // Called by addObserver(observer, selector, name, object); without it nothing is registered.
   std::function<void(const ObjectPtr&, const Selector&, const NSNotificationName&,
                      const ObjectPtr&)>
       addObserverBlock;
+  // Answers addObserverForName(name, object, queue, block); without it, a new NSObject as the token
+  // (the block is never called).
   std::function<ObjectPtr(const NSNotificationName&, const ObjectPtr&,
                           const std::shared_ptr<OperationQueue>&,
                           std::function<void(const NSNotificationPtr&)>)>
       addObserverForNameBlock;
+  // Called by postNotification(notification); without it nothing is delivered.
   std::function<void(const NSNotificationPtr&)> postNotificationBlock;
+  // Called by postNotificationName(name, object); without it nothing is delivered.
   std::function<void(const NSNotificationName&, const ObjectPtr&)> postNotificationNameObjectBlock;
+  // Called by postNotificationName(name, object, userInfo); without it nothing is delivered.
   std::function<void(const NSNotificationName&, const ObjectPtr&, const Dictionary&)>
       postNotificationNameObjectUserInfoBlock;
+  // Called by removeObserver(observer); without it nothing happens.
   std::function<void(const ObjectPtr&)> removeObserverBlock;
+  // Called by removeObserver(observer, name, object); without it nothing happens.
   std::function<void(const ObjectPtr&, const NSNotificationName&, const ObjectPtr&)>
       removeObserverNameObjectBlock;
 

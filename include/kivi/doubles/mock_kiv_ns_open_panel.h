@@ -1,8 +1,8 @@
 // MockKivNSOpenPanel: a scriptable KivNSOpenPanelProtocol. It is a
 // MockKivNSSavePanel (the same callbacks, mockUrl and stored values for all
 // that the two panels share) with the open panel's choices as stored
-// values, the chosen files set with setUrls(), and close() calling
-// panelCloseBlock.
+// values (all false at first), the chosen files set with setUrls(), and
+// close() calling panelCloseBlock.
 //
 //   auto panel = std::make_shared<kivi::MockKivNSOpenPanel>();
 //   panel->setUrls({kivi::URL::fileURLWithPath("/tmp/a.crt")});
@@ -26,6 +26,7 @@ class KIVI_EXPORT MockKivNSOpenPanel : public MockKivNSSavePanel, public KivNSOp
  public:
   MockKivNSOpenPanel() = default;
 
+  // Called by close(); without it nothing happens.
   std::function<void()> panelCloseBlock;
 
   bool canChooseFiles() const override { return canChooseFiles_; }
@@ -37,6 +38,7 @@ class KIVI_EXPORT MockKivNSOpenPanel : public MockKivNSSavePanel, public KivNSOp
   std::vector<URLPtr> urls() const override { return urls_; }
   // What urls() answers.
   void setUrls(std::vector<URLPtr> urls) { urls_ = std::move(urls); }
+
   void close() override {
     if (panelCloseBlock) panelCloseBlock();
   }

@@ -29,13 +29,20 @@ class KIVI_EXPORT MockKivNSOperationQueue : public Object, public OperationQueue
  public:
   MockKivNSOperationQueue() = default;
 
+  // Called by addOperation(operation); without it the operation is dropped.
   std::function<void(const OperationPtr&)> addOperationBlock;
+  // Called by addOperations(operations, waitUntilFinished); without it they are dropped.
   std::function<void(const std::vector<OperationPtr>&, bool)> addOperationsBlock;
+  // Called by cancelAllOperations(); without it nothing happens.
   std::function<void()> cancelAllOperationsBlock;
+  // Called by waitUntilAllOperationsAreFinished(); without it the call returns at once.
   std::function<void()> waitUntilAllOperationsAreFinishedBlock;
+  // Called by the key-value addObserver(observer, keyPath, options, context); without it nothing is
+  // observed.
   std::function<void(const std::shared_ptr<Object>&, std::string_view, KeyValueObservingOptions,
                      void*)>
       addObserverBlock;
+  // Called by removeObserver(observer, keyPath); without it nothing happens.
   std::function<void(const Object*, std::string_view)> removeObserverBlock;
 
   std::string description() const override { return Object::description(); }

@@ -28,7 +28,9 @@ class KIVI_EXPORT MockKivNSPasteBoard : public Object, public KivNSPasteBoardPro
  public:
   MockKivNSPasteBoard() = default;
 
+  // Answers setString(string, type); without it, false.
   std::function<bool(const std::string&, const NSPasteboardType&)> pasteBoardServiceBlock;
+  // Answers prepareForNewContents(options); without it, 0.
   std::function<std::int64_t(NSPasteboardContentsOptions)> prepareForNewContentBlock;
 
   bool setString(const std::string& string, const NSPasteboardType& type) override {

@@ -23,6 +23,7 @@ class KIVI_EXPORT MockKivNSPipeFactory : public Object, public KivNSPipeFactoryP
  public:
   MockKivNSPipeFactory() = default;
 
+  // Answers createPipe(); without it, a new real pipe (NSPipe::pipe()).
   std::function<std::shared_ptr<NSPipe>()> createMockPipeBlock;
 
   std::shared_ptr<NSPipe> createPipe() override {

@@ -37,12 +37,19 @@ class KIVI_EXPORT MockKivNSProcess : public Object, public KivNSProcessProtocol 
  public:
   MockKivNSProcess() = default;
 
+  // Called by launch(); without it nothing starts.
   std::function<void()> launchBlock;
+  // Called by waitUntilExit(); without it the call returns at once.
   std::function<void()> waitUntilExitBlock;
+  // Answers launchAndReturnError(error) and decides what the error receives; without it, true.
   std::function<bool(ErrorPtr*)> runBlock;
+  // Answers isRunning(); without it, false.
   std::function<bool()> isRunningBlock;
+  // What terminationStatus() answers; nullopt: 1.
   std::optional<std::int32_t> mockTerminationStatus;
+  // What terminationReason() answers; nullopt: NSTaskTerminationReasonExit.
   std::optional<std::int64_t> mockTerminationReason;
+  // A flag for the test's own use; isRunning() does not read it.
   bool mockRunning = false;
 
   URLPtr executableURL() const override { return executableURL_; }

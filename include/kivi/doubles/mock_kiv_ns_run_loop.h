@@ -22,11 +22,16 @@ namespace kivi {
 
 class KIVI_EXPORT MockKivNSRunLoop : public KivNSRunLoopProtocol {
  public:
+  // Called by run(); without it the call returns at once.
   std::function<void()> runBlock;
+  // Called by run(limitDate); without it the call returns at once.
   std::function<void(Date)> runUntilLimitDateBlock;
+  // Answers run(mode, limitDate); without it, false.
   std::function<bool(const RunLoopMode&, Date)> runInModeBeforeLimitDateBlock;
+  // Called by perform(modes, block); without it the block is dropped.
   std::function<void(const std::vector<RunLoopMode>&, std::function<void()>)>
       performInModesWithBlock;
+  // Called by perform(block); without it the block is dropped.
   std::function<void(std::function<void()>)> performWithBlock;
 
   void run() override {

@@ -33,6 +33,8 @@ class KIVI_EXPORT MockKivNSRunningApplication : public Object,
  public:
   MockKivNSRunningApplication() = default;
 
+  // Class-level: answers runningApplicationsWithBundleIdentifier(bundleIdentifier) for every
+  // object; without it, an empty list.
   static inline std::function<std::vector<std::shared_ptr<NSRunningApplication>>(
       const std::string&)>
       runningApplicationsBlock;

@@ -3,8 +3,8 @@
 // beginSheetModal() and begin() hand their arguments, completion included,
 // to beginSheetModalBlock and beginBlock; the callback decides whether and
 // with what response the completion runs. Without them no completion is
-// called. The panel's properties are plain stored values; url() answers
-// mockUrl.
+// called. The panel's properties are plain stored values (nullopt, null,
+// false or "" at first; the delegate held strongly); url() answers mockUrl.
 //
 //   auto panel = std::make_shared<kivi::MockKivNSSavePanel>();
 //   panel->mockUrl = kivi::URL::fileURLWithPath("/tmp/export.log");
@@ -29,8 +29,11 @@ class KIVI_EXPORT MockKivNSSavePanel : public Object, public virtual KivNSSavePa
  public:
   MockKivNSSavePanel() = default;
 
+  // Called by beginSheetModal(window, completionHandler); without it the completion is never
+  // called.
   std::function<void(const std::shared_ptr<NSWindow>&, NSModalCompletionHandler)>
       beginSheetModalBlock;
+  // Called by begin(completionHandler); without it the completion is never called.
   std::function<void(NSModalCompletionHandler)> beginBlock;
   // What url() answers.
   URLPtr mockUrl;

@@ -26,7 +26,9 @@ class KIVI_EXPORT MockKivNSSharingService : public Object, public KivNSSharingSe
  public:
   MockKivNSSharingService() = default;
 
+  // Called by perform(items); without it nothing is shared.
   std::function<void(const NSSharingItems&)> sharingServicePerformBlock;
+  // Answers canPerform(items); without it, false.
   std::function<bool(const std::optional<NSSharingItems>&)> canPerformServiceBlock;
 
   std::optional<std::string> subject() const override { return subject_; }

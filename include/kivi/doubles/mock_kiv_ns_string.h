@@ -28,6 +28,7 @@ class KIVI_EXPORT MockKivNSString : public Object, public KivNSStringProtocol {
  public:
   MockKivNSString() = default;
 
+  // Answers writeToURL(url, atomically, encoding, error); without it, false.
   std::function<bool(const URLPtr&, bool, NSStringEncoding, ErrorPtr*)>
       writeNSStringToURLImplementationBlock;
 

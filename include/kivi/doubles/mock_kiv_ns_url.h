@@ -39,9 +39,12 @@ class KIVI_EXPORT MockKivNSURL : public Object, public KivNSURLProtocol {
  public:
   MockKivNSURL() = default;
 
+  // Class-level: answers bookmarkDataWithOptions(options, keys, relativeTo, error); without it,
+  // empty data.
   static inline std::function<std::optional<Data>(
       std::uint64_t, const std::optional<std::vector<std::string>>&, const URLPtr&, ErrorPtr*)>
       bookmarkDataBlock;
+  // Class-level: answers writeBookmarkData(data, url, options, error); without it, false.
   static inline std::function<bool(const Data&, const URLPtr&, std::int64_t, ErrorPtr*)>
       writeBookmarkDataBlock;
 
@@ -57,6 +60,7 @@ class KIVI_EXPORT MockKivNSURL : public Object, public KivNSURLProtocol {
   std::optional<std::string> path() const override { return path_; }
   // What path() answers.
   void setPath(std::optional<std::string> path) { path_ = std::move(path); }
+
   bool writeBookmarkData(const Data& data, const URLPtr& url, std::int64_t options,
                          ErrorPtr* error) const override {
     return writeBookmarkDataBlock ? writeBookmarkDataBlock(data, url, options, error) : false;

@@ -29,23 +29,41 @@ class KIVI_EXPORT MockKivNSUserDefaults : public Object, public KivNSUserDefault
  public:
   MockKivNSUserDefaults() = default;
 
+  // Called by setObject(value, defaultName); without it nothing is stored.
   std::function<void(const Value&, const std::string&)> setObjectForKeyBlock;
+  // Answers objectForKey(defaultName); without it, the null marker.
   std::function<Value(const std::string&)> objectForKeyBlock;
+  // Called by setInteger(value, defaultName); without it nothing is stored.
   std::function<void(std::int64_t, const std::string&)> setIntegerForKeyBlock;
+  // Answers integerForKey(defaultName); without it, 0.
   std::function<std::int64_t(const std::string&)> integerForKeyBlock;
+  // Called by setBool(value, defaultName); without it nothing is stored.
   std::function<void(bool, const std::string&)> setBoolForKeyBlock;
+  // Answers boolForKey(defaultName); without it, false.
   std::function<bool(const std::string&)> boolForKeyBlock;
+  // Called by setURL(url, defaultName); without it nothing is stored.
   std::function<void(const URLPtr&, const std::string&)> setURLForKeyBlock;
+  // Answers URLForKey(defaultName); without it, null.
   std::function<URLPtr(const std::string&)> urlForKeyBlock;
+  // Answers stringForKey(defaultName); without it, "".
   std::function<std::string(const std::string&)> stringForKeyBlock;
+  // Answers arrayForKey(defaultName); without it, an empty array.
   std::function<Array(const std::string&)> arrayForKeyBlock;
+  // Answers dictionaryForKey(defaultName); without it, an empty dictionary.
   std::function<Dictionary(const std::string&)> dictionaryForKeyBlock;
+  // Answers dataForKey(defaultName); without it, empty data.
   std::function<Data(const std::string&)> dataForKeyBlock;
+  // Answers stringArrayForKey(defaultName); without it, an empty list.
   std::function<std::vector<std::string>(const std::string&)> stringArrayForKeyBlock;
+  // Answers floatForKey(defaultName); without it, 0.
   std::function<float(const std::string&)> floatForKeyBlock;
+  // Answers doubleForKey(defaultName); without it, 0.
   std::function<double(const std::string&)> doubleForKeyBlock;
+  // Called by removeObjectForKey(defaultName); without it nothing happens.
   std::function<void(const std::string&)> removeObjectForKeyBlock;
+  // Called by removePersistentDomainForName(domainName); without it nothing happens.
   std::function<void(const std::string&)> removePersistentDomainForNameBlock;
+  // Answers valueForKeyPath(keyPath); without it, the null marker.
   std::function<Value(const std::string&)> valueForKeyPathBlock;
 
   std::string description() const override { return Object::description(); }

@@ -28,9 +28,13 @@ class KIVI_EXPORT MockKivNSWindow : public Object, public KivNSWindowProtocol {
  public:
   MockKivNSWindow() = default;
 
+  // Called by center(); without it nothing happens.
   std::function<void()> centerBlock;
+  // Called by makeKeyAndOrderFront(sender); without it nothing happens.
   std::function<void(const ObjectPtr&)> makeKeyAndOrderFrontBlock;
+  // Called by close(); without it nothing happens.
   std::function<void()> windowCloseBlock;
+  // The window's title ("" at first); no operation reads it.
   std::string title;
 
   std::shared_ptr<NSViewController> contentViewController() const override {

@@ -32,18 +32,28 @@ class KIVI_EXPORT MockKivNSWorkspace : public Object, public KivNSWorkspaceProto
  public:
   MockKivNSWorkspace() = default;
 
+  // Answers openURL(url); without it, false.
   std::function<bool(const URLPtr&)> openURLBlock;
+  // Called by openApplicationAtURL(applicationURL, configuration, completionHandler); without it
+  // the completion is never called.
   std::function<void(const URLPtr&, const NSWorkspaceOpenConfiguration&,
                      NSWorkspaceCompletionHandler)>
       openApplicationURLBlock;
+  // Called by openURL(url, configuration, completionHandler); without it the completion is never
+  // called.
   std::function<void(const URLPtr&, const NSWorkspaceOpenConfiguration&,
                      NSWorkspaceCompletionHandler)>
       openURLConfigurationBlock;
+  // Called by noteFileSystemChanged(path); without it nothing happens.
   std::function<void(const std::string&)> noteFileSystemChangedBlock;
+  // Answers URLForApplicationWithBundleIdentifier(bundleIdentifier); without it, null.
   std::function<URLPtr(const std::string&)> urlForApplicationWithBundleIdentifierBlock;
+  // Called by openURLs(urls, applicationURL, configuration, completionHandler); without it the
+  // completion is never called.
   std::function<void(const std::vector<URLPtr>&, const URLPtr&, const NSWorkspaceOpenConfiguration&,
                      NSWorkspaceCompletionHandler)>
       openURLsWithAppAtConfigurationBlock;
+  // Called by activateFileViewerSelectingURLs(fileURLs); without it nothing happens.
   std::function<void(const std::vector<URLPtr>&)> activateFileViewerSelectingBlock;
 
   bool openURL(const URLPtr& url) override { return openURLBlock ? openURLBlock(url) : false; }

@@ -33,20 +33,27 @@ namespace kivi {
 
 class KIVI_EXPORT MockKivNSXPCListener : public Object, public NSXPCListenerDelegate {
  public:
+  // Listens at once: makes an anonymous listener, becomes its delegate and resumes it. Destroying
+  // the double invalidates the listener.
   MockKivNSXPCListener(std::shared_ptr<NSXPCInterface> interface, ObjectPtr exportedObject);
   ~MockKivNSXPCListener() override;
 
+  // Asked about each new connection; false refuses it. Without it every connection is accepted.
   std::function<bool(const std::shared_ptr<NSXPCListener>&,
                      const std::shared_ptr<NSXPCConnection>&)>
       shouldAcceptNewConnectionBlock;
 
+  // The interface each accepted connection exports; the constructor's at first.
   std::shared_ptr<NSXPCInterface> connectionInterface() const { return connectionInterface_; }
   void setConnectionInterface(std::shared_ptr<NSXPCInterface> interface) {
     connectionInterface_ = std::move(interface);
   }
+  // The object each accepted connection exports; the constructor's at first.
   ObjectPtr exportedObject() const { return exportedObject_; }
   void setExportedObject(ObjectPtr object) { exportedObject_ = std::move(object); }
+  // The real listener the double is the delegate of.
   const std::shared_ptr<NSXPCListener>& listener() const { return listener_; }
+  // The listener's endpoint, for the client under test.
   std::shared_ptr<NSXPCListenerEndpoint> endpoint() const { return listener_->endpoint(); }
 
   bool listener(const std::shared_ptr<NSXPCListener>& listener,

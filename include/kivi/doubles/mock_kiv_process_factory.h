@@ -26,6 +26,7 @@ class KIVI_EXPORT MockKivProcessFactory : public Object, public KivNSProcessFact
  public:
   MockKivProcessFactory() = default;
 
+  // Answers createProcess(); without it, a new MockKivNSProcess.
   std::function<std::shared_ptr<KivNSProcessProtocol>()> createMockProcessBlock;
 
   std::shared_ptr<KivNSProcessProtocol> createProcess() override {

@@ -30,12 +30,16 @@ namespace kivi {
 
 class KIVI_EXPORT MockKivSDKLoggerDelegate : public Object, public KivSdkLoggerDelegate {
  public:
+  // Receives one line as the logger passed it; the views die with the call.
   using LogBlock = std::function<void(std::string_view module, std::string_view fileName,
                                       std::string_view functionName, std::uint64_t lineNumber,
                                       std::string_view message)>;
 
   MockKivSDKLoggerDelegate() = default;
 
+  // One per level: logVerboseWithModule() calls logVerboseBlock,
+  // logInfoWithModule() logInfoBlock, and so on; without its callback a
+  // level's lines are dropped.
   LogBlock logVerboseBlock;
   LogBlock logInfoBlock;
   LogBlock logSupportBlock;

@@ -27,7 +27,9 @@ class KIVI_EXPORT MockKivTimer : public Object, public KivTimerProtocol {
  public:
   MockKivTimer() = default;
 
+  // Called by start(); without it nothing happens.
   std::function<void()> startTimerBlock;
+  // Called by cancel(); without it nothing happens.
   std::function<void()> cancelTimerBlock;
 
   void start() override;

@@ -33,25 +33,37 @@ class KIVI_EXPORT MockKivUNUserNotificationCenter : public Object,
  public:
   MockKivUNUserNotificationCenter() = default;
 
+  // Called by add(request, completionHandler); without it nothing is shown and the completion is
+  // never called.
   std::function<void(const UNNotificationRequest&, std::function<void(const ErrorPtr&)>)> addBlock;
+  // Called by requestAuthorization(options, completionHandler); without it the completion is never
+  // called.
   std::function<void(UNAuthorizationOptions, std::function<void(bool, const ErrorPtr&)>)>
       requestAuthorizationBlock;
+  // Called by getNotificationCategories(completionHandler); without it the completion is never
+  // called.
   std::function<void(std::function<void(const std::set<UNNotificationCategory>&)>)>
       getNotificationCategoriesBlock;
+  // Called by setNotificationCategories(categories); without it nothing is stored.
   std::function<void(const std::set<UNNotificationCategory>&)> setNotificationCategoriesBlock;
 
   std::shared_ptr<UNUserNotificationCenterDelegate> delegate() override { return delegate_; }
   void setDelegate(const std::shared_ptr<UNUserNotificationCenterDelegate>& delegate) override {
     delegate_ = delegate;
   }
+  // Shows the notification `request` describes; here, hands both arguments to addBlock.
   void add(const UNNotificationRequest& request,
            std::function<void(const ErrorPtr&)> completionHandler) override {
     if (addBlock) addBlock(request, std::move(completionHandler));
   }
+  // Asks the user's permission for `options`; here, hands both arguments to
+  // requestAuthorizationBlock.
   void requestAuthorization(UNAuthorizationOptions options,
                             std::function<void(bool, const ErrorPtr&)> completionHandler) override {
     if (requestAuthorizationBlock) requestAuthorizationBlock(options, std::move(completionHandler));
   }
+  // Hands the registered categories to `completionHandler`; here, hands the completion to
+  // getNotificationCategoriesBlock.
   void getNotificationCategories(
       std::function<void(const std::set<UNNotificationCategory>&)> completionHandler) override {
     if (getNotificationCategoriesBlock)

@@ -28,8 +28,11 @@ class KIVI_EXPORT MockKivWKHTTPCookieStore : public Object, public KivWKHTTPCook
  public:
   MockKivWKHTTPCookieStore() = default;
 
+  // Called by setCookie(cookie, completionHandler); without it nothing is stored and the completion
+  // is never called.
   std::function<void(const HTTPCookiePtr&, std::function<void()>)>
       setCookiesWithCompletionHandlerBlock;
+  // What getAllCookies() hands its completion; nullopt: an empty list.
   std::optional<std::vector<HTTPCookiePtr>> availableCookies;
 
   std::string description() const override { return Object::description(); }

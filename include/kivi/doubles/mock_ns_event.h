@@ -32,7 +32,9 @@ class KIVI_EXPORT MockNSEvent : public Object, public KivNSEventProtocol {
  public:
   MockNSEvent() = default;
 
+  // Class-level: answers addLocalMonitorForEvents(mask, handler); without it, null (no monitor).
   static inline std::function<ObjectPtr(NSEventMask, NSEventMonitorHandler)> addLocalMonitorBlock;
+  // Class-level: called by removeMonitor(monitor); without it nothing happens.
   static inline std::function<void(const ObjectPtr&)> removeMonitorBlock;
 
   ObjectPtr addLocalMonitorForEvents(NSEventMask mask, NSEventMonitorHandler handler) override {

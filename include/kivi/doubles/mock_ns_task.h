@@ -26,10 +26,13 @@ namespace kivi {
 
 class KIVI_EXPORT MockNSTask : public Object, public KivNSTaskProtocol {
  public:
+  // A task whose terminationStatus() is always `terminationStatus` (0 by default).
   MockNSTask() = default;
   explicit MockNSTask(std::int32_t terminationStatus) : terminationStatus_(terminationStatus) {}
 
+  // Called by launch(); without it nothing runs.
   std::function<void()> kivLaunchBlock;
+  // Called by waitUntilExit(); without it the call returns at once.
   std::function<void()> kivWaitUntilExitBlock;
 
   std::string description() const override { return Object::description(); }

@@ -67,6 +67,7 @@ class KIVI_EXPORT KivUloFileParser {
   static constexpr std::int32_t kStepsPerSquareKilobyte = 420;
   static constexpr std::int32_t kMaxSteps = 1 << 17;
 
+  // A parser of the launch file's whole text, kept as given.
   explicit KivUloFileParser(std::string uloFile) : uloFile_(std::move(uloFile)) {}
 
   // The setting's value, or absent when the name is not set on a line ending

@@ -22,6 +22,7 @@ class KIVI_EXPORT KivFeatureFlagProviderProtocol {
   // The base object interface.
   virtual std::string description() const = 0;
 
+  // Whether the flag `featureFlagName` of the service `serviceName` is on.
   virtual bool valueForFeatureFlagWithServiceName(const std::string& serviceName,
                                                   const std::string& featureFlagName) = 0;
 };

@@ -43,16 +43,26 @@ class KIVI_EXPORT KivNSDistributedNotificationCenterProtocol {
   // The base object interface.
   virtual std::string description() const = 0;
 
+  // Posts a notification named `name` from the sender `object` to the
+  // session's observers; `deliverImmediately` reaches suspended observers at
+  // once, whatever their suspension behaviour.
   virtual void postNotificationName(const NSNotificationName& name, const std::string& object,
                                     const Dictionary& userInfo, bool deliverImmediately) = 0;
+  // The same with NSDistributedNotificationOptions bits.
   virtual void postNotificationName(const NSNotificationName& name, const std::string& object,
                                     const Dictionary& userInfo,
                                     NSDistributedNotificationOptions options) = 0;
+  // Calls `selector` on `observer` with each notification named `name` from
+  // the sender `object` ("" for any sender); `suspensionBehavior` decides
+  // what happens to those posted while the application is suspended.
   virtual void addObserver(const ObjectPtr& observer, const Selector& selector,
                            const NSNotificationName& name, const std::string& object,
                            NSNotificationSuspensionBehavior suspensionBehavior) = 0;
+  // The same with NSNotificationSuspensionBehaviorCoalesce.
   virtual void addObserver(const ObjectPtr& observer, const Selector& selector,
                            const NSNotificationName& name, const std::string& object) = 0;
+  // Stops delivering the notifications named `name` from `object` to
+  // `observer`.
   virtual void removeObserver(const ObjectPtr& observer, const NSNotificationName& name,
                               const std::string& object) = 0;
 };

@@ -42,14 +42,19 @@ inline constexpr NSFileCoordinatorWritingOptions NSFileCoordinatorWritingForRepl
 
 // One file to read or write in coordinateAccessWithIntents().
 struct KIVI_EXPORT NSFileAccessIntent {
+  // The file to read or write.
   URLPtr url;
+  // Whether the file is written (else read).
   bool writing = false;
+  // NSFileCoordinatorWritingOptions when `writing`, else ...ReadingOptions.
   std::uint64_t options = 0;
 
+  // An intent to read `url`.
   static NSFileAccessIntent readingIntentWithURL(URLPtr url,
                                                  NSFileCoordinatorReadingOptions options) {
     return {std::move(url), false, options};
   }
+  // An intent to write `url`.
   static NSFileAccessIntent writingIntentWithURL(URLPtr url,
                                                  NSFileCoordinatorWritingOptions options) {
     return {std::move(url), true, options};
@@ -63,16 +68,25 @@ class KIVI_EXPORT KivNSFileCoordinatorProtocol {
   // The base object interface.
   virtual std::string description() const = 0;
 
+  // Runs `accessor` with the URL to read `url` through, once other writers
+  // let it be read; when that cannot be, sets `*error` instead.
   virtual void coordinateReadingItemAtURL(const URLPtr& url,
                                           NSFileCoordinatorReadingOptions options, ErrorPtr* error,
                                           std::function<void(const URLPtr&)> accessor) = 0;
+  // Runs `accessor` with the URL to write `url` through, once other readers
+  // and writers let it be written; when that cannot be, sets `*error`
+  // instead.
   virtual void coordinateWritingItemAtURL(const URLPtr& url,
                                           NSFileCoordinatorWritingOptions options, ErrorPtr* error,
                                           std::function<void(const URLPtr&)> accessor) = 0;
+  // Reads `readingURL` and writes `writingURL` in one coordination: `accessor`
+  // receives the URL to use for each, in that order.
   virtual void coordinateReadingItemAtURL(
       const URLPtr& readingURL, NSFileCoordinatorReadingOptions readingOptions,
       const URLPtr& writingURL, NSFileCoordinatorWritingOptions writingOptions, ErrorPtr* error,
       std::function<void(const URLPtr&, const URLPtr&)> accessor) = 0;
+  // Writes two files in one coordination (moving one to the other, say):
+  // `accessor` receives the URL to use for each, in that order.
   virtual void coordinateWritingItemAtURL(
       const URLPtr& url1, NSFileCoordinatorWritingOptions options1, const URLPtr& url2,
       NSFileCoordinatorWritingOptions options2, ErrorPtr* error,

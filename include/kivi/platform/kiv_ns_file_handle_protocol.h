@@ -19,7 +19,9 @@ class KIVI_EXPORT KivNSFileHandleProtocol {
  public:
   virtual ~KivNSFileHandleProtocol() = default;
 
+  // Closes the file; nothing may be written after it.
   virtual void closeFile() = 0;
+  // Writes all of `data` at the file's current position.
   virtual void writeData(const Data& data) = 0;
 };
 

@@ -20,6 +20,8 @@
 
 namespace kivi {
 
+// Which cookies setCookies() accepts: all, none, or only those of the main
+// document's domain.
 using NSHTTPCookieAcceptPolicy = std::uint64_t;
 inline constexpr NSHTTPCookieAcceptPolicy NSHTTPCookieAcceptPolicyAlways = 0;
 inline constexpr NSHTTPCookieAcceptPolicy NSHTTPCookieAcceptPolicyNever = 1;
@@ -32,13 +34,23 @@ class KIVI_EXPORT KivNSHTTPCookieStorageProtocol {
   // The base object interface.
   virtual std::string description() const = 0;
 
+  // Stores `cookie`, in place of a stored one with the same name, domain and
+  // path.
   virtual void setCookie(const HTTPCookiePtr& cookie) = 0;
+  // Removes `cookie` from the store.
   virtual void deleteCookie(const HTTPCookiePtr& cookie) = 0;
+  // Stores the `cookies` a response from `url` set, as far as the accept
+  // policy allows; `mainDocumentURL` is the page that made the request (null
+  // for none).
   virtual void setCookies(const std::vector<HTTPCookiePtr>& cookies, const URLPtr& url,
                           const URLPtr& mainDocumentURL) = 0;
+  // The stored cookies a request to `url` would send.
   virtual std::vector<HTTPCookiePtr> cookiesForURL(const URLPtr& url) = 0;
+  // Removes the cookies stored since `date`.
   virtual void removeCookiesSinceDate(Date date) = 0;
+  // Every stored cookie.
   virtual std::vector<HTTPCookiePtr> cookies() const = 0;
+  // The policy setCookies() follows.
   virtual NSHTTPCookieAcceptPolicy cookieAcceptPolicy() const = 0;
   virtual void setCookieAcceptPolicy(NSHTTPCookieAcceptPolicy policy) = 0;
 };

@@ -28,10 +28,15 @@ class KIVI_EXPORT KivNSItemProviderProtocol {
   // The base object interface.
   virtual std::string description() const = 0;
 
-  // Answers the progress of the load.
+  // Copies the item's data of type `typeIdentifier` to a temporary file and
+  // calls `completionHandler` with its URL, or with null and the error; the
+  // file is removed once the handler returns. Answers the load's progress.
   virtual NSProgressPtr loadFileRepresentationForTypeIdentifier(
       const std::string& typeIdentifier,
       std::function<void(const URLPtr& url, const ErrorPtr& error)> completionHandler) = 0;
+  // Makes an object of `aClass` from the item's data and calls
+  // `completionHandler` with it, or with null and the error. Answers the
+  // load's progress.
   virtual NSProgressPtr loadObjectOfClass(
       const NSItemProviderReadingClass& aClass,
       std::function<void(const NSItemProviderReadingPtr& object, const ErrorPtr& error)>

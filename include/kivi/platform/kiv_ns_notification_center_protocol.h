@@ -25,6 +25,7 @@
 
 namespace kivi {
 
+// The name a notification is posted and observed under.
 using NSNotificationName = std::string;
 
 class KIVI_EXPORT KivNSNotificationCenterProtocol {
@@ -43,11 +44,18 @@ class KIVI_EXPORT KivNSNotificationCenterProtocol {
   virtual ObjectPtr addObserverForName(const NSNotificationName& name, const ObjectPtr& object,
                                        const std::shared_ptr<OperationQueue>& queue,
                                        std::function<void(const NSNotificationPtr&)> block) = 0;
+  // Delivers `notification` to every observer registered for it.
   virtual void postNotification(const NSNotificationPtr& notification) = 0;
+  // Posts a new notification named `name` about `object` (null for none),
+  // with `userInfo` (empty when not given).
   virtual void postNotificationName(const NSNotificationName& name, const ObjectPtr& object) = 0;
   virtual void postNotificationName(const NSNotificationName& name, const ObjectPtr& object,
                                     const Dictionary& userInfo) = 0;
+  // Removes every registration of `observer`: an object that was given a
+  // selector, or a token addObserverForName() answered.
   virtual void removeObserver(const ObjectPtr& observer) = 0;
+  // Removes the registrations of `observer` for the notifications named
+  // `name` about `object` (null: about any object).
   virtual void removeObserver(const ObjectPtr& observer, const NSNotificationName& name,
                               const ObjectPtr& object) = 0;
 };

@@ -24,14 +24,18 @@ namespace kivi {
 
 class KIVI_EXPORT KivNSOpenPanelProtocol : public virtual KivNSSavePanelProtocol {
  public:
+  // Whether the user may choose files.
   virtual bool canChooseFiles() const = 0;
   virtual void setCanChooseFiles(bool flag) = 0;
+  // Whether the user may choose more than one item.
   virtual bool allowsMultipleSelection() const = 0;
   virtual void setAllowsMultipleSelection(bool flag) = 0;
+  // Whether the user may choose folders.
   virtual bool canChooseDirectories() const = 0;
   virtual void setCanChooseDirectories(bool flag) = 0;
   // The chosen files and folders; empty until the user chose.
   virtual std::vector<URLPtr> urls() const = 0;
+  // Takes the panel off the screen.
   virtual void close() = 0;
 };
 

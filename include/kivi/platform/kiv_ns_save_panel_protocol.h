@@ -34,16 +34,22 @@ class KIVI_EXPORT KivNSSavePanelProtocol {
  public:
   virtual ~KivNSSavePanelProtocol() = default;
 
+  // The panel's title; nullopt for the default one.
   virtual std::optional<std::string> title() const = 0;
   virtual void setTitle(std::optional<std::string> title) = 0;
+  // The label of the file-name field; nullopt for the default one.
   virtual std::optional<std::string> nameFieldLabel() const = 0;
   virtual void setNameFieldLabel(std::optional<std::string> label) = 0;
+  // Decides which files may be chosen; null for none (all may).
   virtual std::shared_ptr<NSOpenSavePanelDelegate> delegate() const = 0;
   virtual void setDelegate(std::shared_ptr<NSOpenSavePanelDelegate> delegate) = 0;
+  // Whether the panel lets the user make a new folder.
   virtual bool canCreateDirectories() const = 0;
   virtual void setCanCreateDirectories(bool flag) = 0;
   // The chosen file; null until the user chose one.
   virtual URLPtr url() const = 0;
+  // The file name in the name field: the proposed one before the user
+  // chose, the chosen one after.
   virtual std::string nameFieldStringValue() const = 0;
   virtual void setNameFieldStringValue(std::string value) = 0;
   // Shows the panel as a sheet of `window`.

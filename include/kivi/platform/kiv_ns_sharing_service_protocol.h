@@ -25,10 +25,13 @@ class KIVI_EXPORT KivNSSharingServiceProtocol {
  public:
   virtual ~KivNSSharingServiceProtocol() = default;
 
+  // The subject of what is sent (a mail's); nullopt for none.
   virtual std::optional<std::string> subject() const = 0;
   virtual void setSubject(std::optional<std::string> subject) = 0;
+  // Whom it is sent to (addresses, handles); nullopt: the user chooses.
   virtual std::optional<std::vector<std::string>> recipients() const = 0;
   virtual void setRecipients(std::optional<std::vector<std::string>> recipients) = 0;
+  // Shares `items` with the subject and recipients set.
   virtual void perform(const NSSharingItems& items) = 0;
   // Whether the service can share `items`; nullopt asks without items.
   virtual bool canPerform(const std::optional<NSSharingItems>& items) = 0;

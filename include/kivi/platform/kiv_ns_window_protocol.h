@@ -22,12 +22,15 @@ class KIVI_EXPORT KivNSWindowProtocol {
  public:
   virtual ~KivNSWindowProtocol() = default;
 
+  // The controller whose view fills the window; null for none.
   virtual std::shared_ptr<NSViewController> contentViewController() const = 0;
   virtual void setContentViewController(std::shared_ptr<NSViewController> controller) = 0;
+  // Moves the window to the centre of its screen.
   virtual void center() = 0;
   // Shows the window in front and gives it the keyboard; `sender` (null for
   // none) is who asked.
   virtual void makeKeyAndOrderFront(const ObjectPtr& sender) = 0;
+  // Takes the window off the screen.
   virtual void close() = 0;
 };
 

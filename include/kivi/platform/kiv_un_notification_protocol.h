@@ -27,8 +27,10 @@ class KIVI_EXPORT KivUNNotificationProtocol {
   // The base object interface.
   virtual std::string description() const = 0;
 
+  // When the notification was delivered.
   virtual Date date() const = 0;
   virtual void setDate(Date date) = 0;
+  // The request it was delivered for: its identifier, content and trigger.
   virtual UNNotificationRequest request() const = 0;
   virtual void setRequest(UNNotificationRequest request) = 0;
 };

@@ -30,8 +30,12 @@ class KIVI_EXPORT KivUNNotificationResponseProtocol {
   // The base object interface.
   virtual std::string description() const = 0;
 
+  // The notification the user answered.
   virtual std::shared_ptr<UNNotification> notification() const = 0;
   virtual void setNotification(std::shared_ptr<UNNotification> notification) = 0;
+  // The chosen action's identifier: UNNotificationDefaultActionIdentifier
+  // for a click on the notification, UNNotificationDismissActionIdentifier
+  // for its dismissal.
   virtual std::string actionIdentifier() const = 0;
   virtual void setActionIdentifier(std::string identifier) = 0;
 };

@@ -21,6 +21,7 @@ namespace kivi {
 class KIVI_EXPORT KivUNTextInputNotificationResponseProtocol
     : public virtual KivUNNotificationResponseProtocol {
  public:
+  // The text the user typed.
   virtual std::string userText() const = 0;
   virtual void setUserText(std::string text) = 0;
 };

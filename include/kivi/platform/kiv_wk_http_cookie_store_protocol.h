@@ -29,8 +29,11 @@ class KIVI_EXPORT KivWKHTTPCookieStoreProtocol {
   // The base object interface.
   virtual std::string description() const = 0;
 
+  // Calls `completionHandler` with every cookie of the store.
   virtual void getAllCookies(
       std::function<void(const std::vector<HTTPCookiePtr>&)> completionHandler) = 0;
+  // Stores `cookie`, in place of one with the same name, domain and path,
+  // then calls `completionHandler` (null for none).
   virtual void setCookie(const HTTPCookiePtr& cookie, std::function<void()> completionHandler) = 0;
 };
 

@@ -58,11 +58,14 @@ class NSXPCListener;
 // object implements.
 class KIVI_EXPORT NSXPCInterface : public Object {
  public:
+  // An interface of the protocol named `protocolName`.
   explicit NSXPCInterface(std::string protocolName) : protocolName_(std::move(protocolName)) {}
   static std::shared_ptr<NSXPCInterface> interfaceWithProtocol(std::string protocolName) {
     return std::make_shared<NSXPCInterface>(std::move(protocolName));
   }
+  // The name given when it was made.
   const std::string& protocolName() const noexcept { return protocolName_; }
+
   std::string className() const override { return "NSXPCInterface"; }
 
  private:
@@ -82,6 +85,7 @@ class KIVI_EXPORT NSXPCListenerEndpoint : public Object {
   };
 
  public:
+  // Made by NSXPCListener::endpoint() only (the Token is private).
   NSXPCListenerEndpoint(Token, std::weak_ptr<NSXPCListener> listener)
       : listener_(std::move(listener)) {}
 
@@ -99,6 +103,8 @@ class KIVI_EXPORT NSXPCListenerDelegate {
                         const std::shared_ptr<NSXPCConnection>& newConnection) = 0;
 };
 
+// Receives the connections made to its endpoint and lets its delegate accept
+// or refuse each.
 class KIVI_EXPORT NSXPCListener : public Object {
   struct Token {
     explicit Token() = default;
@@ -107,7 +113,9 @@ class KIVI_EXPORT NSXPCListener : public Object {
  public:
   // A new listener that only clients given its endpoint can reach.
   static std::shared_ptr<NSXPCListener> anonymousListener();
+  // Made by anonymousListener() only (the Token is private).
   explicit NSXPCListener(Token);
+  // Invalidates the clients still waiting for this listener's resume().
   ~NSXPCListener() override;
 
   // Held weakly.
@@ -131,6 +139,8 @@ class KIVI_EXPORT NSXPCListener : public Object {
   const std::unique_ptr<State> state_;
 };
 
+// One end of a connection: a client's, made for an endpoint, or the
+// listener's, handed to its delegate.
 class KIVI_EXPORT NSXPCConnection : public Object {
   struct Token {
     explicit Token() = default;
@@ -143,21 +153,31 @@ class KIVI_EXPORT NSXPCConnection : public Object {
   static std::shared_ptr<NSXPCConnection> create(std::shared_ptr<NSXPCListenerEndpoint> endpoint) {
     return std::make_shared<NSXPCConnection>(std::move(endpoint));
   }
+  // The listener's end, made by NSXPCListener only (the Token is private).
   NSXPCConnection(Token);
+  // Destroying a client's end invalidates the listener's end.
   ~NSXPCConnection() override;
 
+  // The interface of the object this end exports; a description only.
   std::shared_ptr<NSXPCInterface> exportedInterface() const;
   void setExportedInterface(std::shared_ptr<NSXPCInterface> interface);
+  // What the other end's remoteObjectProxy() answers; null for nothing.
   ObjectPtr exportedObject() const;
   void setExportedObject(ObjectPtr object);
+  // The interface expected of the other end's object; a description only.
   std::shared_ptr<NSXPCInterface> remoteObjectInterface() const;
   void setRemoteObjectInterface(std::shared_ptr<NSXPCInterface> interface);
   // The other end's exported object once accepted; null otherwise.
   ObjectPtr remoteObjectProxy() const;
+  // Called at most once, when this end is invalidated; null for none. A
+  // handler set after the invalidation is dropped.
   std::function<void()> invalidationHandler() const;
   void setInvalidationHandler(std::function<void()> handler);
 
+  // Hands a client's end to its endpoint's listener. Again, or on the
+  // listener's end (resumed already): nothing.
   void resume();
+  // Ends the connection, both ends of it. Again: nothing.
   void invalidate();
 
   std::string className() const override { return "NSXPCConnection"; }

@@ -35,6 +35,7 @@ constexpr std::size_t encodedLength(std::size_t byteCount) noexcept {
   return (byteCount / 3 + (byteCount % 3 != 0)) * 4;
 }
 
+// The padded base64 text of `bytes`, encodedLength() characters long.
 KIVI_EXPORT std::string encode(std::span<const std::uint8_t> bytes);
 KIVI_EXPORT std::string encode(std::string_view bytes);
 

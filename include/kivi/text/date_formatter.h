@@ -49,15 +49,18 @@ class KIVI_EXPORT DateFormatter {
   explicit DateFormatter(std::string dateFormat,
                          std::optional<std::string> localeIdentifier = std::nullopt,
                          std::optional<std::string> timeZoneIdentifier = std::nullopt);
+
   ~DateFormatter();
   DateFormatter(const DateFormatter&) = delete;
   DateFormatter& operator=(const DateFormatter&) = delete;
 
+  // The pattern given at creation.
   const std::string& dateFormat() const noexcept;
   // Absent when the formatter follows the process default.
   const std::optional<std::string>& localeIdentifier() const noexcept;
   const std::optional<std::string>& timeZoneIdentifier() const noexcept;
 
+  // The date as text, or the text as a date, by the pattern (see above for what fails).
   std::string stringFromDate(Date date) const;
   std::optional<Date> dateFromString(std::string_view text) const;
 

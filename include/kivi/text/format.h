@@ -67,11 +67,13 @@
 
 namespace kivi {
 
+// The largest width or precision honoured; a larger one is taken as this.
 inline constexpr int kMaxFormatField = 4096;
 
 // One argument of the engine: a tagged reference to, or copy of, a value.
 class KIVI_EXPORT FormatArg {
  public:
+  // What the argument holds; it decides which accessor below is meaningful.
   enum class Kind : std::uint8_t { Int, UInt, Double, CString, String, Value, Object, Pointer };
 
   // The FormatArg for one argument. Accepts: integers (char and bool
@@ -82,6 +84,7 @@ class KIVI_EXPORT FormatArg {
   template <class T>
   static FormatArg from(const T& arg) noexcept;
 
+  // A signed integer, an unsigned integer or a double argument; from() picks the maker.
   static FormatArg signedInt(std::int64_t v) noexcept { return FormatArg(Kind::Int, v); }
   static FormatArg unsignedInt(std::uint64_t v) noexcept { return FormatArg(Kind::UInt, v); }
   static FormatArg floating(double v) noexcept {
@@ -89,33 +92,39 @@ class KIVI_EXPORT FormatArg {
     a.d_ = v;
     return a;
   }
+  // A C string, which may be null; referred to, not copied.
   static FormatArg cString(const char* s) noexcept {
     FormatArg a(Kind::CString);
     a.p_ = s;
     return a;
   }
+  // Text, referred to, not copied.
   static FormatArg string(std::string_view s) noexcept {
     FormatArg a(Kind::String);
     a.p_ = s.data();
     a.size_ = s.size();
     return a;
   }
+  // A Value, referred to, not copied.
   static FormatArg value(const Value& v) noexcept {
     FormatArg a(Kind::Value);
     a.p_ = &v;
     return a;
   }
+  // An object, which may be null.
   static FormatArg object(const Object* o) noexcept {
     FormatArg a(Kind::Object);
     a.p_ = o;
     return a;
   }
+  // Any other pointer, which may be null.
   static FormatArg pointer(const void* p) noexcept {
     FormatArg a(Kind::Pointer);
     a.p_ = p;
     return a;
   }
 
+  // What the argument holds.
   Kind kind() const noexcept { return kind_; }
   // Each accessor is meaningful for its own kind only.
   std::int64_t intValue() const noexcept { return static_cast<std::int64_t>(u_); }

@@ -39,21 +39,31 @@ inline constexpr std::int64_t PropertyListReadCorruptError = 3840;
 // The value cannot be written as JSON.
 inline constexpr std::int64_t PropertyListWriteInvalidError = 3852;
 
+// How dataWithJSONObject() writes: a bitwise OR of the options below (0: compact text).
 using JSONWritingOptions = std::uint64_t;
+// Indented by two spaces, with "key" : value.
 inline constexpr JSONWritingOptions JSONWritingPrettyPrinted = 1;
+// Keys in byte order, as they are always written anyway.
 inline constexpr JSONWritingOptions JSONWritingSortedKeys = 2;
+// A lone string, number or null marker is allowed at the top level.
 inline constexpr JSONWritingOptions JSONWritingFragmentsAllowed = 4;
+// "/" is written as it is, not as "\/".
 inline constexpr JSONWritingOptions JSONWritingWithoutEscapingSlashes = 8;
 
+// How JSONObjectWithData() reads: a bitwise OR of the options below (0: none).
 using JSONReadingOptions = std::uint64_t;
+// Accepted and ignored: a Value is changed by copying it out (see Value).
 inline constexpr JSONReadingOptions JSONReadingMutableContainers = 1;
 inline constexpr JSONReadingOptions JSONReadingMutableLeaves = 2;
+// Any value is allowed at the top level, not only an array or a dictionary.
 inline constexpr JSONReadingOptions JSONReadingFragmentsAllowed = 4;
 
 class KIVI_EXPORT JSONSerialization {
  public:
+  // The deepest nesting of arrays and dictionaries read or written.
   static constexpr std::size_t kMaxDepth = 1024;
 
+  // Whether `value` is a valid JSON object as defined above, so that writing it succeeds.
   static bool isValidJSONObject(const Value& value);
 
   // Null and *error set when `value` is not valid JSON (with

@@ -43,9 +43,10 @@ namespace kivi {
 
 // A span of a UTF-8 text, in bytes.
 struct KIVI_EXPORT TextRange {
-  std::size_t location = 0;
-  std::size_t length = 0;
+  std::size_t location = 0;  // the offset of the first byte
+  std::size_t length = 0;    // in bytes
 
+  // The offset just past the range.
   std::size_t end() const noexcept { return location + length; }
   friend bool operator==(const TextRange&, const TextRange&) = default;
 };
@@ -53,13 +54,22 @@ struct KIVI_EXPORT TextRange {
 // The whole of any text: ranges are clamped to the text they are used with.
 inline constexpr TextRange kWholeText{0, std::numeric_limits<std::size_t>::max()};
 
+// How a pattern compiles: a bitwise OR of the options below (0: none), each ICU's flag of the
+// same meaning.
 using RegularExpressionOptions = std::uint32_t;
+// Letters match whatever their case.
 inline constexpr RegularExpressionOptions RegularExpressionCaseInsensitive = 1 << 0;
+// White space in the pattern is ignored, and `#` starts a comment up to the end of the line.
 inline constexpr RegularExpressionOptions RegularExpressionAllowCommentsAndWhitespace = 1 << 1;
+// The whole pattern is literal text.
 inline constexpr RegularExpressionOptions RegularExpressionIgnoreMetacharacters = 1 << 2;
+// `.` matches line separators too.
 inline constexpr RegularExpressionOptions RegularExpressionDotMatchesLineSeparators = 1 << 3;
+// `^` and `$` match at the start and end of every line, not only of the text.
 inline constexpr RegularExpressionOptions RegularExpressionAnchorsMatchLines = 1 << 4;
+// Only `\n` ends a line for `.`, `^` and `$`.
 inline constexpr RegularExpressionOptions RegularExpressionUseUnixLineSeparators = 1 << 5;
+// `\b` finds word boundaries by Unicode's rules (UAX #29) instead of ICU's simple ones.
 inline constexpr RegularExpressionOptions RegularExpressionUseUnicodeWordBoundaries = 1 << 6;
 
 // The error code of a pattern that does not compile (in kivi::CocoaErrorDomain,
@@ -88,10 +98,12 @@ class KIVI_EXPORT RegularExpression {
   static std::shared_ptr<const RegularExpression> create(std::string_view pattern,
                                                          RegularExpressionOptions options = 0,
                                                          ErrorPtr* error = nullptr);
+
   ~RegularExpression();
   RegularExpression(const RegularExpression&) = delete;
   RegularExpression& operator=(const RegularExpression&) = delete;
 
+  // The pattern and the options it was compiled with.
   const std::string& pattern() const noexcept { return pattern_; }
   RegularExpressionOptions options() const noexcept { return options_; }
 
@@ -111,6 +123,7 @@ class KIVI_EXPORT RegularExpression {
                                const std::function<bool(TextRange)>& visit, StepLimit stepLimit = 0,
                                ErrorPtr* error = nullptr) const;
 
+  // How many non-overlapping matches `range` of `text` holds (up to a stop, see above).
   std::size_t numberOfMatches(std::string_view text, TextRange range = kWholeText,
                               StepLimit stepLimit = 0, ErrorPtr* error = nullptr) const;
 
@@ -124,6 +137,7 @@ class KIVI_EXPORT RegularExpression {
   const std::unique_ptr<Compiled> compiled_;
 };
 
+// How compiled expressions are held: shared and immutable.
 using RegularExpressionPtr = std::shared_ptr<const RegularExpression>;
 
 }  // namespace kivi

@@ -25,6 +25,7 @@
 
 namespace kivi {
 
+// A digest: 32 bytes.
 inline constexpr std::size_t kSha256DigestLength = 32;
 using Sha256Digest = std::array<std::uint8_t, kSha256DigestLength>;
 

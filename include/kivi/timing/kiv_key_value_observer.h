@@ -48,6 +48,8 @@ namespace kivi {
 
 class KIVI_EXPORT KivKeyValueObserver : public Object {
  public:
+  // The callback: the old and the new value (the null Value when not asked for) and the
+  // context given at registration.
   using OnChangeBlock =
       std::function<void(const Value& oldValue, const Value& newValue, void* context)>;
 
@@ -68,11 +70,16 @@ class KIVI_EXPORT KivKeyValueObserver : public Object {
   void observeValueForKeyPath(std::string_view keyPath, Object* object, const Dictionary& change,
                               void* context) override;
 
+  // Whether a registration has added the observation; it stays until the observer goes.
   bool isObserverAdded() const;
+  // The key path and the target given at creation.
   std::string keyPath() const;
   std::shared_ptr<Object> target() const;
+  // The callback; empty until a registration or setOnChangeBlock() sets it.
   OnChangeBlock onChangeBlock() const;
   void setOnChangeBlock(OnChangeBlock onChangeBlock);
+  // The queue the callback runs on; null until a registration sets it. Unlike registration,
+  // setOnChangeQueue(nullptr) leaves no queue, and changes are then dropped.
   std::shared_ptr<KivDispatchQueueProtocol> onChangeQueue() const;
   void setOnChangeQueue(std::shared_ptr<KivDispatchQueueProtocol> onChangeQueue);
 

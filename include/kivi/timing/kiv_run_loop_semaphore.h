@@ -42,6 +42,7 @@ class KIVI_EXPORT KivRunLoopSemaphore : public Object {
 
   KivRunLoopSemaphore() = default;
 
+  // The flag, false until signal(); setDone(false) readies the semaphore for another wait.
   bool done() const noexcept { return done_.load(); }
   void setDone(bool done) noexcept { done_.store(done); }
   // Sets `done`.

@@ -33,16 +33,21 @@ namespace kivi {
 
 class KIVI_EXPORT KIVTimePeriod {
  public:
+  // The unit of the count.
   enum class Case : std::uint8_t { Seconds, Minutes, Hours };
 
+  // A period of `count` seconds.
   static constexpr KIVTimePeriod Seconds(std::int64_t count) noexcept {
     return {Case::Seconds, count};
   }
+  // A period of `count` minutes.
   static constexpr KIVTimePeriod Minutes(std::int64_t count) noexcept {
     return {Case::Minutes, count};
   }
+  // A period of `count` hours.
   static constexpr KIVTimePeriod Hours(std::int64_t count) noexcept { return {Case::Hours, count}; }
 
+  // The case and the count the period was made with.
   constexpr Case kind() const noexcept { return kind_; }
   constexpr std::int64_t count() const noexcept { return count_; }
 
@@ -60,12 +65,15 @@ class KIVI_EXPORT KIVTimePeriod {
 
 // The period constructors on a count.
 namespace Int {
+// KIVTimePeriod::Seconds(count).
 constexpr KIVTimePeriod seconds(std::int64_t count) noexcept {
   return KIVTimePeriod::Seconds(count);
 }
+// KIVTimePeriod::Minutes(count).
 constexpr KIVTimePeriod minutes(std::int64_t count) noexcept {
   return KIVTimePeriod::Minutes(count);
 }
+// KIVTimePeriod::Hours(count).
 constexpr KIVTimePeriod hours(std::int64_t count) noexcept { return KIVTimePeriod::Hours(count); }
 }  // namespace Int
 

@@ -64,6 +64,7 @@ inline constexpr double KivTimerMinimumTimeInterval = 0.0001;
 
 class KIVI_EXPORT KivTimer : public Object, public KivTimerProtocol {
  public:
+  // The timer's callback.
   using CompletionBlock = std::function<void()>;
 
   // initWithCompletionBlock:timerInterval:timerDisposition: — makes a new
@@ -88,18 +89,24 @@ class KIVI_EXPORT KivTimer : public Object, public KivTimerProtocol {
   // taking the monitor.
   void didCompleteTimerOperation(const std::shared_ptr<KivTimerOperation>& operation);
 
+  // Whether cancel() was called after the last start(). The setters here change the flag only.
   bool isCancelled() const;
   void setIsCancelled(bool cancelled);
+  // Whether a countdown is in progress: set by start(), cleared when it ends and by cancel().
   bool isRunning() const;
   void setIsRunning(bool running);
+  // The queue the countdowns run on; the timer makes its own at creation.
   std::shared_ptr<OperationQueueProtocol> operationQueue() const;
   // A null queue is refused (nothing changes). Countdowns already queued stay
   // in the old queue, and cancel() no longer reaches them.
   void setOperationQueue(std::shared_ptr<OperationQueueProtocol> queue);
+  // Seconds per countdown (see Intervals above).
   double timeInterval() const;
   void setTimeInterval(double interval);
+  // Repeating or one-shot (see KivTimerProtocol).
   KivTimerDisposition disposition() const;
   void setDisposition(KivTimerDisposition disposition);
+  // Called at the end of each countdown, as described above; null suppresses the call.
   CompletionBlock completionBlock() const;
   void setCompletionBlock(CompletionBlock block);
 

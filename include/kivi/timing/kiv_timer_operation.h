@@ -33,6 +33,7 @@ class KIVI_EXPORT KivTimerOperation : public Operation {
   // Sleeps the calling thread for timerInterval seconds.
   void main() override;
 
+  // Seconds main() sleeps; read when the sleep begins.
   double timerInterval() const { return timerInterval_.load(std::memory_order_relaxed); }
   void setTimerInterval(double interval) {
     timerInterval_.store(interval, std::memory_order_relaxed);

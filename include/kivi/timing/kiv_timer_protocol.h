@@ -28,6 +28,7 @@
 
 namespace kivi {
 
+// Whether a timer repeats: one of the two values below (any other value is one-shot).
 using KivTimerDisposition = std::uint64_t;
 // Fires once per start().
 inline constexpr KivTimerDisposition KivTimerDispositionOneShot = 0;

@@ -82,11 +82,14 @@ namespace JSONSupport {
 // to a getter.
 class KIVI_EXPORT OptionalKey {
  public:
+  // No key.
   constexpr OptionalKey(std::nullopt_t = std::nullopt) noexcept {}
   constexpr OptionalKey(std::nullptr_t) noexcept {}
+  // `key`, or no key when it is null.
   constexpr OptionalKey(const char* key) noexcept {
     if (key) key_ = std::string_view(key);
   }
+  // `key`; an empty optional gives no key.
   constexpr OptionalKey(std::string_view key) noexcept : key_(key) {}
   OptionalKey(const std::string& key) noexcept : key_(key) {}
   constexpr OptionalKey(std::optional<std::string_view> key) noexcept : key_(key) {}
@@ -94,6 +97,7 @@ class KIVI_EXPORT OptionalKey {
     if (key) key_ = std::string_view(*key);
   }
 
+  // The key, or std::nullopt when there is none.
   constexpr const std::optional<std::string_view>& get() const noexcept { return key_; }
 
  private:
@@ -104,11 +108,13 @@ class KIVI_EXPORT OptionalKey {
 // when the key is missing or its value is of another kind. The pointers point
 // into `dictionary` and live as long as it does.
 
+// The string value.
 KIVI_EXPORT const String* jsonStringForKey(const Dictionary& dictionary, OptionalKey key);
 // Booleans included.
 KIVI_EXPORT std::optional<Number> jsonNumberForKey(const Dictionary& dictionary, OptionalKey key);
 // jsonNumberForKey not zero; false when there is no number.
 KIVI_EXPORT bool jsonBoolForKey(const Dictionary& dictionary, OptionalKey key);
+// The array value, or the dictionary value.
 KIVI_EXPORT const Array* jsonArrayForKey(const Dictionary& dictionary, OptionalKey key);
 KIVI_EXPORT const Dictionary* jsonDictionaryForKey(const Dictionary& dictionary, OptionalKey key);
 

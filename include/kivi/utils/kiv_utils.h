@@ -114,12 +114,14 @@ KIVI_EXPORT std::string sha256AsString(const Data& data);
 // isCaseInsensitiveEqualToString() compares. Other kinds never match.
 KIVI_EXPORT bool trimmedCaseInsensitiveContains(const Array& array, std::string_view needle);
 
-// The elements for which `test(element, index, &stop)` returns true, in
-// order. Once the test sets `stop`, no further element is tested; the answer
-// of that call still counts.
+// A test for subarrayWithObjectsPassingTest(): called with an element, its index and a
+// `stop` flag to set; answers whether the element passes.
 template <typename F>
 concept ElementTest = std::predicate<F&, const Value&, std::size_t, bool*>;
 
+// The elements for which `test(element, index, &stop)` returns true, in
+// order. Once the test sets `stop`, no further element is tested; the answer
+// of that call still counts.
 template <ElementTest Test>
 Array subarrayWithObjectsPassingTest(const Array& array, Test&& test) {
   Array passing;

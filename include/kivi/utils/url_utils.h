@@ -70,6 +70,7 @@ KIVI_EXPORT void setHeaders(MutableURLRequest& request,
 // a non-ASCII character gives null.
 class KIVI_EXPORT KivURL : public URL {
  public:
+  // The URL of `string` as it stands, or null when it is not a valid URL reference.
   static std::shared_ptr<const KivURL> initWithString(std::string_view string);
   // Null for none; otherwise initWithString().
   static std::shared_ptr<const KivURL> URLWithString(const std::optional<std::string>& string);
@@ -80,6 +81,7 @@ class KIVI_EXPORT KivURL : public URL {
   explicit KivURL(std::string string) : URL(std::move(string)) {}
 };
 
+// Cookie lists: filtering by domain, and a form that is safe to log.
 class KIVI_EXPORT HTTPCookieUtils {
  public:
   // The cookies, in their order, whose domain (lowercased, without leading
