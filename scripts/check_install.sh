@@ -9,11 +9,14 @@
 #   5. the same examples built with plain g++ and pkg-config, and run;
 #   6. a static build (BUILD_DIR-static) installed and a "hello" linked
 #      statically through find_package and through pkg-config;
-#   7. the API documentation generated with no Doxygen warning.
+#   7. the API documentation generated with no Doxygen warning;
+#   8. the Debian packages (cpack) installed and used on a clean Debian 12
+#      (scripts/check_deb.sh; as root only, since it uses a chroot).
 # Prints how long each step took and the sizes worth knowing; exits non-zero at
 # the first failure.
 #
 #   scripts/check_install.sh [BUILD_DIR]     (default: build)
+#   KIVI_SKIP_DOCS=1 skips step 7.
 set -euo pipefail
 cd "$(dirname "${BASH_SOURCE[0]}")/.."
 root=$PWD
@@ -22,7 +25,11 @@ work=$build/install-check
 prefix=$work/prefix
 static_build=$build-static
 static_prefix=$work/prefix-static
-rm -rf "$work"
+# A chroot of an earlier run that was killed may still have mounts.
+if command -v findmnt >/dev/null; then
+  findmnt -rn -o TARGET | grep "^$work/" | sort -r | xargs -r umount -l || true
+fi
+rm -rf --one-file-system "$work"
 mkdir -p "$work"
 
 step_start=$SECONDS
@@ -148,9 +155,23 @@ g++ -std=c++20 -O2 $(PKG_CONFIG_PATH=$static_libdir/pkgconfig pkg-config --cflag
 step "static library installed; hello linked statically through find_package and pkg-config"
 
 # 7. API documentation.
-if [[ -f docs/Doxyfile ]]; then
+if [[ -f docs/Doxyfile && -z ${KIVI_SKIP_DOCS:-} ]]; then
   bash scripts/docs.sh "$work/docs" || die "Doxygen warnings (see above)"
   step "API documentation generated with no warning"
+fi
+
+# 8. Debian packages.
+(cd "$build" && cpack -G DEB -B "$work/deb" >"$work/cpack.log" 2>&1) ||
+  { tail -n 30 "$work/cpack.log" >&2; die "cpack -G DEB"; }
+runtime_deps=$(dpkg-deb -f "$work"/deb/libkiviossdk1_*.deb Depends)
+[[ $runtime_deps == *libcurl4* && $runtime_deps == *libicu* ]] ||
+  die "the runtime package's dependencies are incomplete: $runtime_deps"
+if [[ $(id -u) == 0 ]]; then
+  bash scripts/check_deb.sh "$work/deb" --root "$work/debian12" >"$work/check_deb.log" 2>&1 ||
+    { tail -n 30 "$work/check_deb.log" >&2; die "the Debian packages on a clean Debian 12"; }
+  step "Debian packages built, installed and used on a clean Debian 12"
+else
+  step "Debian packages built (not installed on a clean Debian 12: that needs root)"
 fi
 
 # Figures.

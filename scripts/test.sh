@@ -4,7 +4,8 @@
 #   2. the installed package (scripts/check_install.sh): every header alone,
 #      every public symbol exported, the examples built against the installed
 #      package through CMake and pkg-config and run, a static build, the API
-#      documentation without a Doxygen warning;
+#      documentation without a Doxygen warning, the Debian packages installed
+#      on a clean Debian 12 (as root);
 #   3. AddressSanitizer + UBSan build (build-asan/), every suite;
 #   4. ThreadSanitizer build (build-tsan/), the suites labelled "concurrency";
 #   5. libFuzzer build (build-fuzz/, clang), each fuzz target for 20 s.
@@ -17,7 +18,7 @@
 #     --no-fuzz  skip stage 5
 set -euo pipefail
 
-usage() { sed -n '2,17s/^# \{0,1\}//p' "${BASH_SOURCE[0]}"; }
+usage() { sed -n '2,18s/^# \{0,1\}//p' "${BASH_SOURCE[0]}"; }
 
 run_sanitizers=1
 run_tsan=1
@@ -120,7 +121,8 @@ concurrency_targets() {
 # --- 1. Normal build ---------------------------------------------------------
 begin_stage "1/5 normal build (build/, RelWithDebInfo)"
 bash scripts/check_layers.sh || fail "a layer includes from a layer above it"
-configure build -DCMAKE_BUILD_TYPE=RelWithDebInfo -DBUILD_SHARED_LIBS=ON
+# /usr: the Debian packages stage 2 makes from this tree install there.
+configure build -DCMAKE_BUILD_TYPE=RelWithDebInfo -DBUILD_SHARED_LIBS=ON -DCMAKE_INSTALL_PREFIX=/usr
 build build
 run_ctest build
 end_stage
