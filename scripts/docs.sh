@@ -21,8 +21,8 @@ sed -e "s/@PROJECT_VERSION_MAJOR@/$major/g" -e "s/@PROJECT_VERSION_MINOR@/$minor
   -e "s/@PROJECT_VERSION_PATCH@/$patch/g" -e "s/@PROJECT_VERSION@/$version/g" \
   cmake/version.h.in >"$out/generated/kivi/version.h"
 export KIVI_DOCS_OUTPUT=$out
-export KIVI_DOCS_INPUT="$root/include/kivi $out/generated/kivi $root/docs/mainpage.md"
-export KIVI_DOCS_MAINPAGE=$root/docs/mainpage.md
+export KIVI_DOCS_INPUT="$root/include/kivi $out/generated/kivi $root/README.md"
+export KIVI_DOCS_MAINPAGE=$root/README.md
 export KIVI_DOCS_FILTER=$root/scripts/doxygen_filter.py
 export KIVI_DOCS_STRIP="$root/include $out/generated"
 export KIVI_DOCS_WARNINGS=$out/warnings.log

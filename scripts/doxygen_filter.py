@@ -7,7 +7,9 @@ documentation, so the headers keep one comment style.
   a blank line stays a plain comment); a comment after
   code on the same line documents that line's member.
 - A comment over several declarations with no blank line between them
-  documents each of them (a Doxygen member group).
+  documents each of them (a Doxygen member group), as does a comment over
+  one declaration of several names (int a = 1, b = 2;). Such a group ends
+  at the closing brace of a member's body.
 - Lines indented by two or more spaces inside a comment (usage samples,
   tables) are kept as preformatted code.
 Everything else passes through unchanged. The commands it adds take lines
@@ -41,6 +43,27 @@ def convert_block(block, indent, first_line_prefix=""):
 def starts_declaration(line, indent):
     return (line.startswith(indent) and len(line) > len(indent) and not line[len(indent)].isspace()
             and not line.lstrip().startswith(("}", "//", "#", "public:", "protected:", "private:")))
+
+
+def declares_several(lines, start, end):
+    """Whether the one declaration in lines[start:end] names several
+    variables (int a = 1, b = 2;): a comma outside brackets before the ";"
+    and no parenthesis before the first "=" (not a function)."""
+    joined = " ".join(line.strip() for line in lines[start:end])
+    text = joined.split(";")[0]
+    if ";" not in joined or text.startswith("template") or "(" in text.split("=")[0]:
+        return False  # an enumerator, a template, a function
+    depth = 0
+    for ch in text:
+        if ch == "{" and depth == 0:  # a class, an enum, a braced initializer
+            return False
+        if ch in "([{<":
+            depth += 1
+        elif ch in ")]}>":
+            depth -= 1
+        elif ch == "," and depth == 0:
+            return True
+    return False
 
 
 def group_end(lines, start, indent):
@@ -116,7 +139,7 @@ def main():
                                         or following.lstrip().startswith("#define")):
                 end = group_end(lines, i, indent)
                 declarations = sum(1 for k in range(i, end) if starts_declaration(lines[k], indent))
-                if declarations > 1:  # one comment for several lines: a group
+                if declarations > 1 or (declarations == 1 and declares_several(lines, i, end)):
                     out.append(f"{indent}///@{{")
                     out.extend(convert_block(block, indent))
                     out.extend(lines[i:end])

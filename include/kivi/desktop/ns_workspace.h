@@ -82,6 +82,7 @@ inline constexpr std::chrono::milliseconds kNSWorkspaceTimeout{3000};
 
 class KIVI_EXPORT NSWorkspace : public Object, public KivNSWorkspaceProtocol {
  public:
+  // The process's one workspace.
   static std::shared_ptr<NSWorkspace> sharedWorkspace();
 
   bool openURL(const URLPtr& url) override;

@@ -28,15 +28,20 @@
 namespace kivi {
 
 struct KIVI_EXPORT NSWorkspaceOpenConfiguration {
+  // Whether the application comes to the front; ignored (see above).
   bool activates = true;
   // Extra command-line arguments, after those the desktop entry names.
   std::vector<std::string> arguments;
   // Variables added to (or replacing those of) the launched application's
   // environment, which is otherwise this process's.
   std::map<std::string, std::string> environment;
+  // Whether another copy of a running application starts; ignored.
   bool createsNewApplicationInstance = false;
+  // Whether the user may be asked (to choose an application, to allow the launch); ignored.
   bool promptsUserIfNeeded = true;
+  // Whether the URL joins the recent items; ignored.
   bool addsToRecentItems = true;
+  // Whether the application starts hidden; ignored.
   bool hides = false;
 
   // The platform's +configuration: the defaults above.

@@ -70,11 +70,13 @@
 
 namespace kivi {
 
+// The longest the center waits for the notification server to answer.
 inline constexpr std::chrono::milliseconds kUNNotificationCenterTimeout{3000};
 
 class KIVI_EXPORT UNUserNotificationCenter : public Object,
                                              public KivUNUserNotificationCenterProtocol {
  public:
+  // The process's one center, made on first use and kept for the life of the process.
   static std::shared_ptr<UNUserNotificationCenter> currentNotificationCenter();
 
   ~UNUserNotificationCenter() override;

@@ -35,8 +35,12 @@ namespace kivi {
 
 class UNUserNotificationCenter;
 
+// The domain of the notification center's errors; the codes are UNErrorCode's.
 inline constexpr const char* UNErrorDomain = "UNErrorDomain";
 
+// Codes in UNErrorDomain. The center gives UNErrorCodeNotificationsNotAllowed (no server, or
+// no answer in time) and UNErrorCodeNotificationInvalidNoDate (a trigger interval that is not
+// positive); the others are for code that reports those failures itself.
 enum UNErrorCode : std::int64_t {
   UNErrorCodeNotificationsNotAllowed = 1,
   UNErrorCodeAttachmentInvalidURL = 100,
@@ -75,6 +79,7 @@ inline constexpr UNNotificationPresentationOptions UNNotificationPresentationOpt
 inline constexpr UNNotificationPresentationOptions UNNotificationPresentationOptionList = 1 << 3;
 inline constexpr UNNotificationPresentationOptions UNNotificationPresentationOptionBanner = 1 << 4;
 
+// Options of an action, the platform's bits; they are not sent to the notification server.
 using UNNotificationActionOptions = std::uint64_t;
 inline constexpr UNNotificationActionOptions UNNotificationActionOptionNone = 0;
 inline constexpr UNNotificationActionOptions UNNotificationActionOptionAuthenticationRequired =
@@ -82,12 +87,14 @@ inline constexpr UNNotificationActionOptions UNNotificationActionOptionAuthentic
 inline constexpr UNNotificationActionOptions UNNotificationActionOptionDestructive = 1 << 1;
 inline constexpr UNNotificationActionOptions UNNotificationActionOptionForeground = 1 << 2;
 
+// Options of a category, the platform's bits.
 using UNNotificationCategoryOptions = std::uint64_t;
 inline constexpr UNNotificationCategoryOptions UNNotificationCategoryOptionNone = 0;
 // The delegate hears of the user dismissing a notification of this category
 // (a response with UNNotificationDismissActionIdentifier).
 inline constexpr UNNotificationCategoryOptions UNNotificationCategoryOptionCustomDismissAction =
     1 << 0;
+// Kept without effect: the desktop has no car display, and hidden previews are the server's.
 inline constexpr UNNotificationCategoryOptions UNNotificationCategoryOptionAllowInCarPlay = 1 << 1;
 inline constexpr UNNotificationCategoryOptions UNNotificationCategoryOptionHiddenPreviewsShowTitle =
     1 << 2;
@@ -101,13 +108,15 @@ inline constexpr const char* UNNotificationDefaultActionIdentifier =
 inline constexpr const char* UNNotificationDismissActionIdentifier =
     "com.apple.UNNotificationDismissActionIdentifier";
 
+// What a notification says.
 struct KIVI_EXPORT UNNotificationContent {
-  std::string title;
-  std::string subtitle;
-  std::string body;
-  Dictionary userInfo;
+  std::string title;     // the summary line
+  std::string subtitle;  // the body's first line
+  std::string body;      // the text, below the subtitle
+  Dictionary userInfo;   // the application's own values; not shown
   // Names the UNNotificationCategory whose actions the notification offers.
   std::string categoryIdentifier;
+  // Groups related notifications; not sent to the notification server.
   std::string threadIdentifier;
   // Whether the notification plays the default sound.
   bool sound = false;
@@ -118,15 +127,17 @@ struct KIVI_EXPORT UNNotificationContent {
 // Delivers a notification `timeInterval` seconds after it was added; the
 // interval must be positive.
 struct KIVI_EXPORT UNTimeIntervalNotificationTrigger {
-  double timeInterval = 0;
+  double timeInterval = 0;  // seconds after add()
 
   friend bool operator==(const UNTimeIntervalNotificationTrigger&,
                          const UNTimeIntervalNotificationTrigger&) = default;
 };
 
+// A notification for add() to show, at once or after its trigger.
 struct KIVI_EXPORT UNNotificationRequest {
   // A later request with the same identifier replaces the notification.
   std::string identifier;
+  // What the notification says.
   UNNotificationContent content;
   // Absent: deliver now.
   std::optional<UNTimeIntervalNotificationTrigger> trigger;
@@ -134,18 +145,23 @@ struct KIVI_EXPORT UNNotificationRequest {
   friend bool operator==(const UNNotificationRequest&, const UNNotificationRequest&) = default;
 };
 
+// A button that the notifications of a category offer.
 struct KIVI_EXPORT UNNotificationAction {
-  std::string identifier;
-  std::string title;
+  std::string identifier;  // the response's actionIdentifier when the user chooses it
+  std::string title;       // the button's label
+  // UNNotificationActionOption… bits; not sent to the notification server.
   UNNotificationActionOptions options = UNNotificationActionOptionNone;
 
   friend auto operator<=>(const UNNotificationAction&, const UNNotificationAction&) = default;
 };
 
+// A kind of notification, named by UNNotificationContent::categoryIdentifier: the actions
+// its notifications offer and its options.
 struct KIVI_EXPORT UNNotificationCategory {
-  std::string identifier;
-  std::vector<UNNotificationAction> actions;
-  std::vector<std::string> intentIdentifiers;
+  std::string identifier;                      // what categoryIdentifier names
+  std::vector<UNNotificationAction> actions;   // buttons, in this order
+  std::vector<std::string> intentIdentifiers;  // kept without effect
+  // UNNotificationCategoryOption… bits.
   UNNotificationCategoryOptions options = UNNotificationCategoryOptionNone;
 
   // Ordered by every field in turn, so that a std::set holds distinct
@@ -156,10 +172,13 @@ struct KIVI_EXPORT UNNotificationCategory {
 // A delivered notification: when it was delivered, and its request.
 class KIVI_EXPORT UNNotification : public Object {
  public:
+  // Made by the center when the server shows a request.
   UNNotification(Date date, UNNotificationRequest request)
       : date_(date), request_(std::move(request)) {}
 
+  // When the notification was delivered.
   Date date() const { return date_; }
+  // The request it shows.
   const UNNotificationRequest& request() const { return request_; }
 
   std::string className() const override { return "UNNotification"; }
@@ -173,10 +192,14 @@ class KIVI_EXPORT UNNotification : public Object {
 // (UNNotificationDefaultActionIdentifier for the notification itself).
 class KIVI_EXPORT UNNotificationResponse : public Object {
  public:
+  // Made by the center from the server's signal.
   UNNotificationResponse(std::shared_ptr<UNNotification> notification, std::string actionIdentifier)
       : notification_(std::move(notification)), actionIdentifier_(std::move(actionIdentifier)) {}
 
+  // The notification answered.
   const std::shared_ptr<UNNotification>& notification() const { return notification_; }
+  // The chosen action's identifier, UNNotificationDefaultActionIdentifier or
+  // UNNotificationDismissActionIdentifier.
   const std::string& actionIdentifier() const { return actionIdentifier_; }
 
   std::string className() const override { return "UNNotificationResponse"; }
@@ -189,11 +212,13 @@ class KIVI_EXPORT UNNotificationResponse : public Object {
 // A response that carries text the user typed.
 class KIVI_EXPORT UNTextInputNotificationResponse : public UNNotificationResponse {
  public:
+  // Made by the center from the server's inline reply.
   UNTextInputNotificationResponse(std::shared_ptr<UNNotification> notification,
                                   std::string actionIdentifier, std::string userText)
       : UNNotificationResponse(std::move(notification), std::move(actionIdentifier)),
         userText_(std::move(userText)) {}
 
+  // What the user typed.
   const std::string& userText() const { return userText_; }
 
   std::string className() const override { return "UNTextInputNotificationResponse"; }

@@ -35,16 +35,21 @@ class KIVI_EXPORT EULocaleDetector : public Object {
 
   // A new detector on every call (always an EULocaleDetector_Mac).
   static std::shared_ptr<EULocaleDetectorProtocol> createEULocaleDetector();
+  // Whether the current locale's region is on the region list, or else the local time zone
+  // on the time-zone list; both are read afresh on each call.
   static bool doesDeviceAppearToBeLocatedInEUBasedOnLocaleAndTimeZone();
-  // False for null.
+  // Whether the region code or the zone is on its list (see above); false for null.
   static bool isEUCountryCode(const std::optional<std::string>& code);
   static bool isEUTimeZone(const std::shared_ptr<const TimeZone>& timeZone);
 };
 
+// The detector createEULocaleDetector() makes: it answers from this machine's locale and time
+// zone.
 class KIVI_EXPORT EULocaleDetector_Mac : public Object, public EULocaleDetectorProtocol {
  public:
   EULocaleDetector_Mac() = default;
 
+  // EULocaleDetector::doesDeviceAppearToBeLocatedInEUBasedOnLocaleAndTimeZone().
   bool doesDeviceAppearToBeLocatedInEU() override;
 
   std::string description() const override { return Object::description(); }

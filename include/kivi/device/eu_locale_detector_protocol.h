@@ -23,6 +23,7 @@ class KIVI_EXPORT EULocaleDetectorProtocol {
   // The base object interface.
   virtual std::string description() const = 0;
 
+  // Whether the device is to be taken as located in the European Union or a neighbour.
   virtual bool doesDeviceAppearToBeLocatedInEU() = 0;
 };
 

@@ -54,26 +54,39 @@ class KIVI_EXPORT KivDevice : public Object {
 
   // The named kernel value as text ("hw.machine"), or null.
   static std::optional<std::string> getSystemInformationByName(const char* name);
+  // The machine identifier's "PlatformName" ("Simulator x86_64") and "HardwareName"
+  // ("Simulator"): the identifier itself when the table lacks it, "UnDetermined" when it
+  // cannot be read.
   static std::string platformName();
   static std::string hardwareModel();
+  // Whether the machine identifier names one of those models (never true on a PC).
   static bool isDeviceiPadPro();
   static bool isDeviceiPhoneX();
 
+  // Whether `context` finds a reader of the kind KivBiometricAuthType… names (TouchID: a
+  // fingerprint reader) with a finger of this user enrolled; false for a null context.
+  // `error`, when not null, receives the context's error (null when capable).
   static bool isCapableOfBiometricAuthForContext(const std::shared_ptr<LAContext>& context,
                                                  std::uint64_t biometricAuthType, ErrorPtr* error);
+  // The same with a new LAContext: for a fingerprint reader, for a face reader (never found
+  // here), or for either.
   static bool isTouchIDCapableWithError(ErrorPtr* error);
   static bool isFaceIDCapableWithError(ErrorPtr* error);
   static bool isDeviceBiometricsCapableWithError(ErrorPtr* error);
 
-  // Bytes, or -1.
+  // This process's resident size and own memory (task_vm_info_data_t's resident_size and
+  // phys_footprint), in bytes, or -1.
   static std::int64_t processResidentSize();
   static std::int64_t processPhysicalFootprint();
+  // Bytes of memory installed (ProcessInfo::physicalMemory()); 0 when unknown.
   static std::int64_t physicalMemory();
   // Whole percent over the process's threads (above 100 with several
   // processors busy), or -1.
   static std::int64_t percentCpuUsage();
+  // Bytes of the machine's memory that are free, or -1.
   static std::int64_t processFreeMemory();
-  // MiB, or kKivDeviceUnknown.
+  // MiB, or kKivDeviceUnknown: the memory installed and that left to users (hw.physmem and
+  // hw.usermem, so at most 2047), this process's resident size, the machine's free memory.
   static std::uint64_t totalMemory();
   static std::uint64_t userMemory();
   static std::uint64_t applicationMemory();

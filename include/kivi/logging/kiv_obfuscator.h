@@ -40,20 +40,25 @@ class KIVI_EXPORT KivObfuscator {
   // input bytes above 126) ends the result. A bare nullptr means none.
   static std::optional<std::string> transformString(const std::optional<std::string>& string,
                                                     std::uint64_t transformation) noexcept;
+  // transformString(string, kObfuscate).
   static std::optional<std::string> obfuscateString(
       const std::optional<std::string>& string) noexcept {
     return transformString(string, kObfuscate);
   }
+  // transformString(string, kUnobfuscate).
   static std::optional<std::string> unobfuscateString(
       const std::optional<std::string>& string) noexcept {
     return transformString(string, kUnobfuscate);
   }
+  // None, for a bare nullptr (as for std::nullopt).
   static std::optional<std::string> transformString(std::nullptr_t, std::uint64_t) noexcept {
     return std::nullopt;
   }
+  // None, for a bare nullptr.
   static std::optional<std::string> obfuscateString(std::nullptr_t) noexcept {
     return std::nullopt;
   }
+  // None, for a bare nullptr.
   static std::optional<std::string> unobfuscateString(std::nullptr_t) noexcept {
     return std::nullopt;
   }
@@ -62,9 +67,11 @@ class KIVI_EXPORT KivObfuscator {
   // allocation. A null buffer or a length of 0 does nothing.
   static void obfuscateString(std::uint8_t* buffer, std::uint64_t length) noexcept;
   static void unobfuscateString(std::uint8_t* buffer, std::uint64_t length) noexcept;
+  // The same, on a char buffer.
   static void obfuscateString(char* buffer, std::uint64_t length) noexcept {
     obfuscateString(reinterpret_cast<std::uint8_t*>(buffer), length);
   }
+  // The same, on a char buffer.
   static void unobfuscateString(char* buffer, std::uint64_t length) noexcept {
     unobfuscateString(reinterpret_cast<std::uint8_t*>(buffer), length);
   }

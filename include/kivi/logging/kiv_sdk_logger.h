@@ -56,6 +56,8 @@ namespace kivi {
 // string, which are absent. An empty string is present.
 class KIVI_EXPORT KivSdkNullableString {
  public:
+  // Absent by default and from nullptr, std::nullopt or a null C string; present from any
+  // text, even empty.
   constexpr KivSdkNullableString() noexcept = default;
   constexpr KivSdkNullableString(std::nullptr_t) noexcept {}
   constexpr KivSdkNullableString(std::nullopt_t) noexcept {}
@@ -67,6 +69,7 @@ class KIVI_EXPORT KivSdkNullableString {
   KivSdkNullableString(const std::optional<std::string>& s) noexcept
       : data_(s ? s->data() : nullptr), size_(s ? s->size() : 0) {}
 
+  // True when absent.
   constexpr bool isNull() const noexcept { return data_ == nullptr; }
   // The text, or `fallback` when absent.
   constexpr std::string_view valueOr(std::string_view fallback) const noexcept {
@@ -84,6 +87,7 @@ class KIVI_EXPORT KivSdkLogger : public Object {
   // A logger holding `delegate` (may be null) weakly.
   static std::shared_ptr<KivSdkLogger> create(
       const std::shared_ptr<KivSdkLoggerDelegate>& delegate = nullptr);
+
   ~KivSdkLogger() override;
 
   // The delegate, kept alive by the returned pointer; null when none is set or

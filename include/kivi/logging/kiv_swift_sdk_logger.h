@@ -43,6 +43,7 @@ class KIVI_EXPORT KivSwiftSdkLogger {
   KivSwiftSdkLogger(const KivSwiftSdkLogger&) = delete;
   KivSwiftSdkLogger& operator=(const KivSwiftSdkLogger&) = delete;
 
+  // The module of lines logged without one; not synchronised (see above).
   const std::string& defaultModule() const { return defaultModule_; }
   void setDefaultModule(std::string module) { defaultModule_ = std::move(module); }
 

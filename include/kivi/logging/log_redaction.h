@@ -37,6 +37,7 @@
 
 namespace kivi {
 
+// Header fields shared read-only; null for none.
 using HeaderDictionaryPtr = std::shared_ptr<const StringDictionary>;
 
 // The URL's absolute string with every query value masked, percent-decoded
@@ -67,6 +68,7 @@ KIVI_EXPORT HeaderDictionaryPtr KivSdkResponseHeadersForLogging(const HeaderDict
 // string is left as it is; an "Authorization" value of another kind becomes
 // "***", other values of any kind pass through.
 KIVI_EXPORT Value KivSdkResponseHeadersForLogging(const Value& headers, const URLPtr& url);
+// Null, for a bare nullptr.
 inline HeaderDictionaryPtr KivSdkResponseHeadersForLogging(std::nullptr_t, const URLPtr&) {
   return nullptr;
 }

@@ -31,18 +31,20 @@ inline constexpr const char* HTTPCookieValue = "NSHTTPCookieValue";
 inline constexpr const char* HTTPCookieDomain = "NSHTTPCookieDomain";
 
 class HTTPCookie;
+// A cookie, shared and immutable.
 using HTTPCookiePtr = std::shared_ptr<const HTTPCookie>;
 
 class KIVI_EXPORT HTTPCookie : public Object {
  public:
+  // What a cookie is made of, as cookieWithProperties takes it.
   struct Properties {
-    std::string name;
-    std::string value;
-    std::string domain;  // may start with "." (the cookie applies to subdomains)
-    std::string path = "/";
-    std::optional<Date> expiresDate;  // none: a session cookie
-    bool secure = false;
-    bool HTTPOnly = false;
+    std::string name;        // not empty
+    std::string value;       // may be empty
+    std::string domain;      // may start with "." (the cookie applies to subdomains)
+    std::string path = "/";  // the cookie goes with requests for this path and those under it
+    std::optional<Date> expiresDate;            // none: a session cookie
+    bool secure = false;                        // sent over HTTPS only
+    bool HTTPOnly = false;                      // kept from scripts: sent with requests only
     std::optional<std::string> sameSitePolicy;  // "Lax", "Strict", "None"
     friend bool operator==(const Properties&, const Properties&) = default;
   };
@@ -86,6 +88,7 @@ class KIVI_EXPORT HTTPCookie : public Object {
   static std::vector<HTTPCookiePtr> cookiesWithResponseHeaderFields(
       const StringDictionary& headerFields, const URL& url);
 
+  // The properties the cookie was made with (see Properties).
   const std::string& name() const noexcept { return p_.name; }
   const std::string& value() const noexcept { return p_.value; }
   const std::string& domain() const noexcept { return p_.domain; }
@@ -93,7 +96,9 @@ class KIVI_EXPORT HTTPCookie : public Object {
   const std::optional<Date>& expiresDate() const noexcept { return p_.expiresDate; }
   bool isSecure() const noexcept { return p_.secure; }
   bool isHTTPOnly() const noexcept { return p_.HTTPOnly; }
+  // True when the cookie has no expiry date: it lasts until the session ends.
   bool isSessionOnly() const noexcept { return !p_.expiresDate; }
+  // The SameSite policy ("Lax", "Strict", "None"), none when not set; and all properties at once.
   const std::optional<std::string>& sameSitePolicy() const noexcept { return p_.sameSitePolicy; }
   const Properties& properties() const noexcept { return p_; }
 
@@ -103,6 +108,7 @@ class KIVI_EXPORT HTTPCookie : public Object {
   // All properties equal.
   friend bool operator==(const HTTPCookie& a, const HTTPCookie& b) noexcept { return a.p_ == b.p_; }
 
+  // Takes the properties unchecked; cookieWithProperties refuses those a cookie cannot carry.
   explicit HTTPCookie(Properties properties) : p_(std::move(properties)) {}
 
  private:

@@ -18,6 +18,7 @@
 namespace kivi {
 
 class HTTPURLResponse;
+// A response, shared and immutable.
 using HTTPURLResponsePtr = std::shared_ptr<const HTTPURLResponse>;
 
 class KIVI_EXPORT HTTPURLResponse : public Object {
@@ -29,8 +30,11 @@ class KIVI_EXPORT HTTPURLResponse : public Object {
   static HTTPURLResponsePtr create(URLPtr url, std::int64_t statusCode, std::string HTTPVersion,
                                    const StringDictionary& headerFields);
 
+  // The URL answered (the last one when redirects were followed).
   const URLPtr& URL() const noexcept { return url_; }
+  // The status code (200, 404).
   std::int64_t statusCode() const noexcept { return statusCode_; }
+  // The version on the status line ("HTTP/1.1", "HTTP/2").
   const std::string& HTTPVersion() const noexcept { return version_; }
   // Every field, under the spelling the server used first.
   const StringDictionary& allHeaderFields() const noexcept { return fields_; }

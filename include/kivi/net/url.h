@@ -63,6 +63,8 @@ using URLPtr = std::shared_ptr<const URL>;
 
 class KIVI_EXPORT URL : public Object, public KivNSURLProtocol {
  public:
+  // Parses `string` as a URL reference, first percent-encoding the characters a URL cannot
+  // hold unless encodingInvalidCharacters is false (see above); null when it is not one.
   static URLPtr URLWithString(std::string_view string, bool encodingInvalidCharacters = true);
   // "file://" plus `path` percent-encoded (every byte but unreserved
   // characters and "/" and a few sub-delimiters). A relative path is made

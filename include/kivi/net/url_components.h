@@ -32,12 +32,14 @@
 
 namespace kivi {
 
+// One name=value item of a query.
 struct KIVI_EXPORT URLQueryItem {
-  std::string name;
-  std::optional<std::string> value;  // absent: a bare name without "="
+  std::string name;                  // decoded
+  std::optional<std::string> value;  // decoded; absent: a bare name without "="
   friend bool operator==(const URLQueryItem&, const URLQueryItem&) = default;
 };
 
+// A URL taken apart into components that can be read and changed one by one.
 class KIVI_EXPORT URLComponents {
  public:
   URLComponents() = default;
@@ -59,6 +61,8 @@ class KIVI_EXPORT URLComponents {
   std::optional<std::string> query() const;
   std::optional<std::string> fragment() const;
 
+  // Set decoded components, encoded as each component needs; none removes one. The scheme and
+  // port are taken as given: string() refuses a scheme that is not one or a negative port.
   void setScheme(std::optional<std::string> scheme) { scheme_ = std::move(scheme); }
   void setUser(const std::optional<std::string>& user);
   void setPassword(const std::optional<std::string>& password);

@@ -61,41 +61,67 @@ namespace kivi {
 
 struct URLSessionCore;
 
+// The domain of the errors tasks complete with; the codes follow.
 inline constexpr const char* URLErrorDomain = "NSURLErrorDomain";
+// A failure no other code names, or a transfer that could not be prepared.
 inline constexpr std::int64_t URLErrorUnknown = -1;
+// cancel(), invalidateAndCancel(), or a task resumed after the session was invalidated.
 inline constexpr std::int64_t URLErrorCancelled = -999;
+// No URL, no host, or a header field name that is not a token or a name or value
+// holding CR, LF or NUL: nothing was sent.
 inline constexpr std::int64_t URLErrorBadURL = -1000;
+// No byte moved for the request's time-out, or the transfer outlasted
+// timeoutIntervalForResource.
 inline constexpr std::int64_t URLErrorTimedOut = -1001;
+// A scheme other than http and https.
 inline constexpr std::int64_t URLErrorUnsupportedURL = -1002;
+// The host's (or proxy's) name could not be resolved.
 inline constexpr std::int64_t URLErrorCannotFindHost = -1003;
+// No connection could be made.
 inline constexpr std::int64_t URLErrorCannotConnectToHost = -1004;
+// The connection failed while sending or receiving, or closed before the whole answer.
 inline constexpr std::int64_t URLErrorNetworkConnectionLost = -1005;
+// Not given by URLSession (a name that cannot be resolved is URLErrorCannotFindHost).
 inline constexpr std::int64_t URLErrorDNSLookupFailed = -1006;
+// More than 16 redirects.
 inline constexpr std::int64_t URLErrorHTTPTooManyRedirects = -1007;
+// Not given by URLSession; for code that reports these failures itself.
 inline constexpr std::int64_t URLErrorResourceUnavailable = -1008;
 inline constexpr std::int64_t URLErrorNotConnectedToInternet = -1009;
+// An answer that cannot be read as HTTP, or whose header block exceeds
+// maximumResponseHeaderBytes.
 inline constexpr std::int64_t URLErrorBadServerResponse = -1011;
+// Not given by URLSession; for code that reports these failures itself.
 inline constexpr std::int64_t URLErrorZeroByteResource = -1014;
 inline constexpr std::int64_t URLErrorCannotDecodeRawData = -1015;
+// A body whose content encoding (gzip, deflate, brotli) cannot be decoded.
 inline constexpr std::int64_t URLErrorCannotDecodeContentData = -1016;
+// A body whose chunked transfer encoding is broken.
 inline constexpr std::int64_t URLErrorCannotParseResponse = -1017;
+// A body larger than maximumResponseBodyBytes, declared or received.
 inline constexpr std::int64_t URLErrorDataLengthExceedsMaximum = -1103;
+// TLS could not be set up.
 inline constexpr std::int64_t URLErrorSecureConnectionFailed = -1200;
+// The server's certificate did not pass verification.
 inline constexpr std::int64_t URLErrorServerCertificateUntrusted = -1202;
+// Not given by URLSession; for code that reports these failures itself.
 inline constexpr std::int64_t URLErrorClientCertificateRejected = -1205;
 inline constexpr std::int64_t URLErrorCannotLoadFromNetwork = -2000;
 
+// The settings a session is made with.
 struct KIVI_EXPORT URLSessionConfiguration {
+  // The defaults below; the two are alike: a session keeps neither cookies nor a response cache.
   static URLSessionConfiguration defaultSessionConfiguration() { return {}; }
   static URLSessionConfiguration ephemeralSessionConfiguration() { return {}; }
 
   // Longest time with no byte moving, for requests whose own time-out is 0
   // or less (a request's time-out is 60 s unless set).
   double timeoutIntervalForRequest = 60;
-  // Longest time for a whole transfer.
+  // Longest time for a whole transfer, in seconds; 0 or less: no limit.
   double timeoutIntervalForResource = 7 * 24 * 3600;
   // Sent with every request that does not set the same field itself.
   StringDictionary HTTPAdditionalHeaders;
+  // The most connections open to one host at once; 0 or less: no limit.
   std::int64_t HTTPMaximumConnectionsPerHost = 6;
   // Answers whose header block exceeds this fail with
   // URLErrorBadServerResponse.
@@ -105,12 +131,19 @@ struct KIVI_EXPORT URLSessionConfiguration {
   std::size_t maximumResponseBodyBytes = 256 * 1024 * 1024;
 };
 
+// One transfer of a URLSession: made suspended, started by resume(); its completion handler
+// runs once, on the session's delegate queue.
 class KIVI_EXPORT URLSessionTask : public Object {
  public:
+  // Where a task is: suspended until resume(), running, canceling after cancel(), completed
+  // once its handler has been queued.
   enum class State : std::int64_t { running = 0, suspended = 1, canceling = 2, completed = 3 };
 
+  // Unique among the process's tasks, counting up from 1.
   std::uint64_t taskIdentifier() const noexcept { return identifier_; }
+  // The request the task was made with; none for a task of no session.
   const std::optional<URLRequest>& originalRequest() const noexcept { return original_; }
+  // Where the task is (see State).
   State state() const noexcept { return state_; }
   // Set once the task has completed.
   HTTPURLResponsePtr response() const;
@@ -141,6 +174,7 @@ class KIVI_EXPORT URLSessionTask : public Object {
   const std::unique_ptr<Impl> impl_;
 };
 
+// A task whose whole body comes to its completion handler as Data.
 class KIVI_EXPORT URLSessionDataTask : public URLSessionTask {
  public:
   std::string className() const override { return "NSURLSessionDataTask"; }
@@ -150,6 +184,7 @@ class KIVI_EXPORT URLSessionDataTask : public URLSessionTask {
   friend class URLSession;
 };
 
+// Tasks are shared: the session holds a running one until it completes.
 using URLSessionTaskPtr = std::shared_ptr<URLSessionTask>;
 using URLSessionDataTaskPtr = std::shared_ptr<URLSessionDataTask>;
 
@@ -166,6 +201,7 @@ class KIVI_EXPORT URLSession : public Object {
   [[nodiscard]] static std::shared_ptr<URLSession> sessionWithConfiguration(
       URLSessionConfiguration configuration,
       std::shared_ptr<OperationQueue> delegateQueue = nullptr);
+  // Running tasks finish; the connections close after them.
   ~URLSession() override;
 
   // A suspended task; resume() sends the request.
@@ -174,9 +210,12 @@ class KIVI_EXPORT URLSession : public Object {
   [[nodiscard]] URLSessionDataTaskPtr dataTaskWithURL(URLPtr url,
                                                       DataTaskCompletionHandler completionHandler);
 
+  // The configuration the session was made with.
   const URLSessionConfiguration& configuration() const noexcept { return configuration_; }
+  // Where completion handlers run: the queue given, or the session's own serial queue.
   const std::shared_ptr<OperationQueue>& delegateQueue() const noexcept { return delegateQueue_; }
 
+  // Running tasks finish (finishTasksAndInvalidate) or are cancelled (invalidateAndCancel).
   // New tasks fail at once with URLErrorCancelled after either call.
   void finishTasksAndInvalidate();
   void invalidateAndCancel();
@@ -191,6 +230,7 @@ class KIVI_EXPORT URLSession : public Object {
   std::shared_ptr<URLSessionCore> core_;
 };
 
+// A shared session; releasing the last reference lets its running tasks finish.
 using URLSessionPtr = std::shared_ptr<URLSession>;
 
 }  // namespace kivi

@@ -55,24 +55,32 @@
 
 namespace kivi {
 
+// An asynchronous operation whose state is two flags, with a readiness gate the host controls.
 class KIVI_EXPORT KivAsyncOperationObjC : public Operation {
  public:
   KivAsyncOperationObjC() = default;
 
+  // Always true: the work ends after start() has returned.
   bool isAsynchronous() const override { return true; }
+  // From moveToExecutingState() until coreCompleteOperation().
   bool isExecuting() const override;
+  // From coreCompleteOperation() on.
   bool isFinished() const override;
   // readyState() (through the virtual getter) and, if it is true, the base
   // readiness (dependencies finished).
   bool isReady() const override;
 
+  // Sets Executing (announced as above); called from start(), at most once.
   virtual void moveToExecutingState();
+  // Sets Finished and no longer Executing (announced as above); the last call of the work.
   virtual void coreCompleteOperation();
 
+  // The host's readiness gate: true unless the host set it false.
   virtual bool readyState() const;
   // Announces "isReady", even when the value does not change.
   virtual void setReadyState(bool readyState);
 
+  // The error the work ended with; null for success. Set before coreCompleteOperation().
   virtual ErrorPtr completionError() const;
   virtual void setCompletionError(ErrorPtr error);
 
@@ -87,8 +95,10 @@ class KIVI_EXPORT KivAsyncOperationObjC : public Operation {
   ErrorPtr completionError_;
 };
 
+// An asynchronous operation whose state is one State value.
 class KIVI_EXPORT KivAsyncOperation : public Operation {
  public:
+  // Ready until moveToExecutingState(), then executing until coreCompleteOperation().
   enum class State : std::uint8_t { ready, executing, finished };
 
   // "Ready", "Executing", "Finished".
@@ -98,15 +108,21 @@ class KIVI_EXPORT KivAsyncOperation : public Operation {
 
   KivAsyncOperation() = default;
 
+  // The error the work ended with; null for success. Set before coreCompleteOperation().
   virtual ErrorPtr completionError() const;
   virtual void setCompletionError(ErrorPtr error);
+  // The current state. setState() only stores it: the transitions below announce the change.
   virtual State state() const;
   virtual void setState(State state);
 
+  // Moves to executing (announced as above); called from start(), at most once.
   virtual void moveToExecutingState();
+  // Moves to finished (announced as above); the last call of the work.
   virtual void coreCompleteOperation();
 
+  // Always true: the work ends after start() has returned.
   bool isAsynchronous() const override { return true; }
+  // Whether state() is executing, or finished.
   bool isExecuting() const override { return state() == State::executing; }
   bool isFinished() const override { return state() == State::finished; }
 

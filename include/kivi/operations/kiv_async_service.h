@@ -56,14 +56,16 @@
 
 namespace kivi {
 
+// An observable service that runs its operations on one queue.
 class KIVI_EXPORT KivAsyncServiceObjC : public Object {
  public:
-  // A queue named `name` with a concurrency limit of 1.
+  // A queue named `operationQueueName` with a concurrency limit of 1.
   explicit KivAsyncServiceObjC(std::string operationQueueName);
   // A new kivi::OperationQueue; then its name, then its limit, passed through
   // unchanged.
   KivAsyncServiceObjC(std::string operationQueueName, std::int64_t maxConcurrentOperationCount);
 
+  // The queue the service's operations run on; a host may put a double in its place.
   virtual std::shared_ptr<OperationQueueProtocol> operationQueue() const;
   // Announces "operationQueue".
   virtual void setOperationQueue(std::shared_ptr<OperationQueueProtocol> operationQueue);
@@ -74,11 +76,15 @@ class KIVI_EXPORT KivAsyncServiceObjC : public Object {
   std::shared_ptr<OperationQueueProtocol> operationQueue_;
 };
 
+// A plain service that runs its operations on one queue; nothing is announced.
 class KIVI_EXPORT KivAsyncService {
  public:
+  // A new kivi::OperationQueue with this name and concurrency limit, passed through unchanged.
   KivAsyncService(std::string operationQueueName, std::int64_t maxConcurrentOperationCount);
+
   virtual ~KivAsyncService() = default;
 
+  // The queue the service's operations run on; a host may put a double in its place.
   virtual std::shared_ptr<OperationQueueProtocol> operationQueue() const;
   virtual void setOperationQueue(std::shared_ptr<OperationQueueProtocol> operationQueue);
 
@@ -86,8 +92,11 @@ class KIVI_EXPORT KivAsyncService {
   std::shared_ptr<OperationQueueProtocol> operationQueue_;
 };
 
+// The operations parked while a workflow runs, oldest first.
 using PendingOperationList = std::deque<OperationPtr>;
 
+// A serial service that runs one atomic workflow at a time and parks the starts that come
+// meanwhile.
 class KIVI_EXPORT KivAtomicWorkflowService : public KivAsyncServiceObjC {
  public:
   // Always serial: the queue's limit is 1. This is the service's only
@@ -108,13 +117,16 @@ class KIVI_EXPORT KivAtomicWorkflowService : public KivAsyncServiceObjC {
       const std::function<void(const OperationPtr& operation, std::uint64_t index, bool* stop)>&
           block);
 
+  // True from a workflow's start until endAtomicWorkflow().
   virtual bool isAtomicWorkflowInProgress() const;
   // Announces "isAtomicWorkflowInProgress".
   virtual void setIsAtomicWorkflowInProgress(bool inProgress);
+  // The lock the workflow operations hold.
   virtual std::shared_ptr<RecursiveLock> atomicWorkFlowLock() const;
   // Announces "atomicWorkFlowLock". A null lock is refused (nothing changes,
   // nothing is announced).
   virtual void setAtomicWorkFlowLock(std::shared_ptr<RecursiveLock> lock);
+  // The parked operations, oldest first.
   virtual std::shared_ptr<PendingOperationList> pendingOperations() const;
   // Announces "pendingOperations". A null list is refused.
   virtual void setPendingOperations(std::shared_ptr<PendingOperationList> pendingOperations);

@@ -40,6 +40,7 @@
 //   JSON writing failed                        FailedToBuildRequest, the writer's error
 //   transport error -999 in URLErrorDomain     Cancelled, the transport error
 //   any other transport error                  RequestFailed, the transport error
+//   no URL session                             RequestFailed, URLErrorUnknown
 //   HTTP 401 / 403                             Unauthorized / AccessDenied, none
 //   answer not declared as JSON (not allowed)  InvalidContentType, domain error 2
 // The transport error wins over 401/403, which win over the content type.
@@ -65,6 +66,8 @@
 
 namespace kivi {
 
+// How a KivJSONAPIOperation ended (see the outcomes above); InvalidServerResponse is for a
+// subclass that cannot use an accepted answer.
 enum KivJSONAPIOperationCompletionStatus : std::uint64_t {
   KivJSONAPIOperationCompletionStatusSuccess = 0,
   KivJSONAPIOperationCompletionStatusCancelled = 1,
@@ -77,11 +80,18 @@ enum KivJSONAPIOperationCompletionStatus : std::uint64_t {
   KivJSONAPIOperationCompletionStatusInvalidServerResponse = 8,
 };
 
+// The domain of the errors the operation makes itself.
 inline constexpr const char* KivJSONAPIOperationErrorDomain =
     "com.zorvik.kiviossdk.KivJSONAPIOperation.errorDomain";
+// httpJSONPostObject() gave a value that is not valid JSON.
 inline constexpr std::int64_t KivJSONAPIJSONConversionErrorCode = 1;
+// The answer was not declared as JSON; the user info holds its header fields under
+// ResponseHeadersKeyName.
 inline constexpr std::int64_t KivJSONAPIInvalidContentTypeError = 2;
+// The requests' time-out in seconds.
 inline constexpr double DefaultJSONAPITimeout = 30.0;
+// The user-info key of an InvalidContentType error's response header fields (a Dictionary;
+// absent when the answer had none).
 inline constexpr const char* ResponseHeadersKeyName = "Response headers";
 
 class KIVI_EXPORT KivJSONAPIOperation : public KivUrlSessionTaskOperationObjC {
@@ -98,34 +108,53 @@ class KIVI_EXPORT KivJSONAPIOperation : public KivUrlSessionTaskOperationObjC {
 
   void start() override;
 
-  // Hooks.
-  // True exactly when restApiURL() is set.
+  // Hooks: start() calls performPreFlightChecks(), then startNetworkRequest(), which builds the
+  // request from the hooks after it. A subclass overrides those it needs.
+
+  // Checks before anything is sent; false completes with InvalidInput. By default, true
+  // exactly when restApiURL() is set.
   virtual bool performPreFlightChecks();
+  // Builds the request, then makes, stores and resumes the data task; completes with
+  // FailedToBuildRequest when there is no request, RequestFailed when there is no session.
   virtual void startNetworkRequest();
+  // The task's completion: stores the response, completes as the outcomes above say, and
+  // hands an accepted answer to processHTTPUrlResponse().
   virtual void didCompleteUrlRequest(const URLRequest& request, const std::optional<Data>& data,
                                      HTTPURLResponsePtr response, ErrorPtr error);
-  // Writes *error on every call (null on success).
+  // restApiURL() with additionalQueryParameters() added, httpMethod(), httpHeaders(), the body
+  // and DefaultJSONAPITimeout; none when it cannot be built. Writes *error on every call (null
+  // on success).
   virtual std::optional<URLRequest> createURLRequestWithError(ErrorPtr* error);
   // {"Content-Type": "application/json", "Accept": "application/json"} merged
   // with additionalHttpHeaders() (exact keys: an additional entry replaces a
   // default with the identical key).
   virtual StringDictionary httpHeaders();
+  // Header fields to add; none by default.
   virtual std::optional<StringDictionary> additionalHttpHeaders();
+  // Query items to add to restApiURL(); none by default.
   virtual std::optional<StringDictionary> additionalQueryParameters();
+  // httpJSONPostObject() written with jsonWritingOptions(); none when there is no object or
+  // on an error (KivJSONAPIJSONConversionErrorCode for an object that is not valid JSON).
   // Writes *error on every call (null on success).
   virtual std::optional<Data> httpPostBodyWithError(ErrorPtr* error);
+  // The object to send as the body; none (no body) by default.
   virtual std::optional<Value> httpJSONPostObject();
+  // "GET" by default.
   virtual std::string httpMethod();
   // Interpret an accepted answer and complete. Does nothing by default.
   virtual void processHTTPUrlResponse(HTTPURLResponsePtr response, const std::optional<Data>& data);
   // Sets completionStatus, then completionError, then completes.
   virtual void completeOperationWithStatus(std::uint64_t status, ErrorPtr completionError);
 
+  // Whether an answer not declared as JSON goes to processHTTPUrlResponse(); false by default.
   virtual bool shouldAllowNonJSONContentTypeResponses() const;
   virtual void setShouldAllowNonJSONContentTypeResponses(bool allow);
+  // The endpoint the operation was made with.
   const URLPtr& restApiURL() const noexcept { return restApiURL_; }
+  // How the body is written; JSONWritingPrettyPrinted by default.
   virtual JSONWritingOptions jsonWritingOptions() const;
   virtual void setJsonWritingOptions(JSONWritingOptions options);
+  // How the operation ended, a KivJSONAPIOperationCompletionStatus; Success until set.
   virtual std::uint64_t completionStatus() const;
   virtual void setCompletionStatus(std::uint64_t status);
 

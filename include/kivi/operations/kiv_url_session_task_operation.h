@@ -51,6 +51,7 @@ class KIVI_EXPORT UrlSessionTaskFields {
 };
 }  // namespace detail
 
+// A task operation on KivAsyncOperationObjC; its session can be replaced.
 class KIVI_EXPORT KivUrlSessionTaskOperationObjC : public KivAsyncOperationObjC {
  public:
   // An operation without a session.
@@ -62,12 +63,16 @@ class KIVI_EXPORT KivUrlSessionTaskOperationObjC : public KivAsyncOperationObjC 
   // Cancels the operation, then the stored task, if any.
   void cancel() override;
 
+  // The session the task is made from; null when there is none.
   virtual URLSessionPtr urlSession() const;
   virtual void setUrlSession(URLSessionPtr urlSession);
+  // The request, for a subclass that records it; none until set.
   virtual std::optional<URLRequest> urlRequest() const;
   virtual void setUrlRequest(std::optional<URLRequest> urlRequest);
+  // The HTTP response, stored when the task completes; null until then.
   virtual HTTPURLResponsePtr urlResponse() const;
   virtual void setUrlResponse(HTTPURLResponsePtr urlResponse);
+  // The task, which cancel() cancels; null until stored.
   virtual URLSessionTaskPtr sessionTaskOperationHandle() const;
   virtual void setSessionTaskOperationHandle(URLSessionTaskPtr task);
 
@@ -77,6 +82,7 @@ class KIVI_EXPORT KivUrlSessionTaskOperationObjC : public KivAsyncOperationObjC 
   detail::UrlSessionTaskFields fields_;
 };
 
+// A task operation on KivAsyncOperation; its session is fixed at creation.
 class KIVI_EXPORT KivUrlSessionTaskOperation : public KivAsyncOperation {
  public:
   // init(urlSession:)
@@ -86,11 +92,15 @@ class KIVI_EXPORT KivUrlSessionTaskOperation : public KivAsyncOperation {
   // Cancels the operation, then the stored task, if any.
   void cancel() override;
 
+  // The session given at creation.
   const URLSessionPtr& urlSession() const noexcept { return urlSession_; }
+  // The task, which cancel() cancels; null until stored.
   virtual URLSessionTaskPtr urlSessionTask() const;
   virtual void setUrlSessionTask(URLSessionTaskPtr task);
+  // The request, for a subclass that records it; none until set.
   virtual std::optional<URLRequest> urlRequest() const;
   virtual void setUrlRequest(std::optional<URLRequest> urlRequest);
+  // The HTTP response, stored when the task completes; null until then.
   virtual HTTPURLResponsePtr urlResponse() const;
   virtual void setUrlResponse(HTTPURLResponsePtr urlResponse);
 

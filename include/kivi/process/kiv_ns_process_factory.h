@@ -30,31 +30,39 @@
 
 namespace kivi {
 
+// Makes child processes.
 class KIVI_EXPORT KivNSProcessFactoryProtocol {
  public:
   virtual ~KivNSProcessFactoryProtocol() = default;
+  // A new process, not launched, with nothing set.
   virtual std::shared_ptr<KivNSProcessProtocol> createProcess() = 0;
 };
 
+// Makes pipes for the standard streams of child processes.
 class KIVI_EXPORT KivNSPipeFactoryProtocol {
  public:
   virtual ~KivNSPipeFactoryProtocol() = default;
+  // A new pipe; null when the system has no descriptors left.
   virtual std::shared_ptr<NSPipe> createPipe() = 0;
 };
 
+// The factory of real child processes: each is an NSTask.
 class KIVI_EXPORT KivNSProcessFactory : public Object, public KivNSProcessFactoryProtocol {
  public:
   KivNSProcessFactory() = default;
   // A new NSTask.
   std::shared_ptr<KivNSProcessProtocol> createProcess() override;
+
   std::string className() const override { return "KivNSProcessFactory"; }
 };
 
+// The factory of real pipes: each is an NSPipe.
 class KIVI_EXPORT KivNSPipeFactory : public Object, public KivNSPipeFactoryProtocol {
  public:
   KivNSPipeFactory() = default;
   // NSPipe::pipe().
   std::shared_ptr<NSPipe> createPipe() override;
+
   std::string className() const override { return "KivNSPipeFactory"; }
 };
 

@@ -41,6 +41,7 @@ class NSTask;
 inline constexpr std::int64_t NSTaskTerminationReasonExit = 1;
 inline constexpr std::int64_t NSTaskTerminationReasonUncaughtSignal = 2;
 
+// Called with the task whose process has ended.
 using NSTaskTerminationHandler = std::function<void(const std::shared_ptr<NSTask>&)>;
 
 class KIVI_EXPORT KivNSProcessProtocol {
@@ -67,6 +68,7 @@ class KIVI_EXPORT KivNSProcessProtocol {
   virtual void setStandardInput(ObjectPtr stream) = 0;
   virtual ObjectPtr standardError() const = 0;
   virtual void setStandardError(ObjectPtr stream) = 0;
+  // True from a successful launch until the process has ended.
   virtual bool isRunning() const = 0;
   // The exit code, or the number of the signal that ended the process.
   virtual std::int32_t terminationStatus() const = 0;
@@ -74,6 +76,7 @@ class KIVI_EXPORT KivNSProcessProtocol {
   // for none.
   virtual NSTaskTerminationHandler terminationHandler() const = 0;
   virtual void setTerminationHandler(NSTaskTerminationHandler handler) = 0;
+  // Launches; a failure shows only in the task's state afterwards.
   virtual void launch() = 0;
   // Blocks until the process has ended.
   virtual void waitUntilExit() = 0;

@@ -59,6 +59,7 @@ class NSFileHandle;
 namespace detail {
 struct FileHandleState;
 }  // namespace detail
+// Called with the handle when data has arrived on it, or at end of file.
 using NSFileHandleReadabilityHandler = std::function<void(const std::shared_ptr<NSFileHandle>&)>;
 
 class KIVI_EXPORT NSFileHandle : public Object {
@@ -81,17 +82,22 @@ class KIVI_EXPORT NSFileHandle : public Object {
   // The descriptor; -1 once closed.
   int fileDescriptor() const;
 
+  // Block until end of file, until some data, or until `length` bytes or end of file (see
+  // Reads above).
   Data readDataToEndOfFile();
   Data availableData();
   Data readDataOfLength(std::size_t length);
+  // Write all of `data`; a failure goes to lastError(), or is answered as false with *error.
   void writeData(const Data& data);
   [[nodiscard]] bool writeData(const Data& data, ErrorPtr* error);
+  // Closes the descriptor and stops the readability handler (see above).
   void closeFile();
 
   // The error of the last read or write that failed on this handle, or
   // null.
   ErrorPtr lastError() const;
 
+  // The handler called as data arrives (see above); null for none.
   NSFileHandleReadabilityHandler readabilityHandler() const;
   void setReadabilityHandler(NSFileHandleReadabilityHandler handler);
 

@@ -28,6 +28,7 @@ namespace kivi {
 
 class KIVI_EXPORT NSPipe : public Object {
  public:
+  // A new pipe; null when the system has no descriptors left.
   static std::shared_ptr<NSPipe> pipe();
 
   // The ends; each closes its descriptor when destroyed or closed.

@@ -77,11 +77,18 @@ class KIVI_EXPORT NSRunningApplication : public Object, public KivNSRunningAppli
   std::vector<std::shared_ptr<NSRunningApplication>> runningApplicationsWithBundleIdentifier(
       const std::string& bundleIdentifier) override;
 
+  // The process id.
   std::int32_t processIdentifier() const;
+  // The desktop entry's id (see above); nullopt when the process has none.
   std::optional<std::string> bundleIdentifier() const;
+  // The program file; null when /proc/<pid>/exe cannot be read.
   URLPtr executableURL() const;
+  // The bundle identifier's last component, else the command name; nullopt when neither is
+  // known.
   std::optional<std::string> localizedName() const;
+  // When the process started; nullopt when that cannot be read.
   std::optional<Date> launchDate() const;
+  // Looks again: true once the process has ended (or its pid belongs to another process).
   bool isTerminated() const;
   // SIGTERM / SIGKILL; false when the process is gone or may not be
   // signalled. Always false under a fake process table.
@@ -91,6 +98,7 @@ class KIVI_EXPORT NSRunningApplication : public Object, public KivNSRunningAppli
   std::string className() const override { return "NSRunningApplication"; }
   std::string description() const override;
 
+  // For the lookups above: an application from its snapshot; null gives one with no process.
   explicit NSRunningApplication(std::shared_ptr<const detail::RunningApplicationSnapshot> snapshot);
 
  private:

@@ -87,28 +87,33 @@
 
 namespace kivi {
 
+// A child's environment: each variable's name and value.
 using NSTaskEnvironment = std::map<std::string, std::string>;
 
 class KIVI_EXPORT NSTask : public Object, public KivNSProcessProtocol {
  public:
   // A new, unlaunched task with nothing set.
   static std::shared_ptr<NSTask> create();
+
   ~NSTask() override;
 
   URLPtr executableURL() const override;
   // Also sets the launch path to the URL's file system path; a URL that is
   // not a file URL is kept but makes launching fail (FileNoSuchFileError).
   void setExecutableURL(URLPtr url) override;
+
   std::int64_t terminationReason() const override;
   std::optional<std::string> launchPath() const override;
   // Also sets the executable URL (null when `path` cannot be one).
   void setLaunchPath(std::optional<std::string> path) override;
+
   std::optional<std::vector<std::string>> arguments() const override;
   void setArguments(std::optional<std::vector<std::string>> arguments) override;
   ObjectPtr standardOutput() const override;
   // An object that is neither an NSPipe nor an NSFileHandle is treated as
-  // null.
+  // null, for each of the three streams.
   void setStandardOutput(ObjectPtr stream) override;
+
   ObjectPtr standardInput() const override;
   void setStandardInput(ObjectPtr stream) override;
   ObjectPtr standardError() const override;
@@ -122,6 +127,7 @@ class KIVI_EXPORT NSTask : public Object, public KivNSProcessProtocol {
   // called from the termination handler of a task whose child has not
   // ended (it is never called before, so this cannot happen).
   void waitUntilExit() override;
+
   bool launchAndReturnError(ErrorPtr* error) override;
 
   // Environment and working directory (see above).

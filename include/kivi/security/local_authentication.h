@@ -34,6 +34,7 @@
 
 namespace kivi {
 
+// What canEvaluatePolicy is asked about.
 enum LAPolicy : std::int64_t {
   // A reader with at least one finger enrolled by the current user.
   LAPolicyDeviceOwnerAuthenticationWithBiometrics = 1,
@@ -41,14 +42,19 @@ enum LAPolicy : std::int64_t {
   LAPolicyDeviceOwnerAuthentication = 2,
 };
 
+// The kind of reader biometryType() reports.
 enum LABiometryType : std::int64_t {
   LABiometryTypeNone = 0,
   LABiometryTypeTouchID = 1,  // a fingerprint reader
   LABiometryTypeFaceID = 2,   // never reported here
 };
 
+// The domain of LAContext's errors; the codes are LAError's.
 inline constexpr const char* LAErrorDomain = "LAErrorDomain";
 
+// Codes in LAErrorDomain. canEvaluatePolicy gives LAErrorBiometryNotEnrolled,
+// LAErrorBiometryNotAvailable and LAErrorInvalidContext (see there); the others are for code
+// that reports those failures itself.
 enum LAError : std::int64_t {
   LAErrorAuthenticationFailed = -1,
   LAErrorUserCancel = -2,

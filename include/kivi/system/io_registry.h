@@ -44,11 +44,15 @@
 
 namespace kivi {
 
+// A handle on a registry object, a service or an entry whose properties are read; 0 is none.
 using io_object_t = mach_port_t;
 using io_service_t = io_object_t;
 using io_registry_entry_t = io_object_t;
+// Option flags of the property lookup (none is used).
 using IOOptionBits = std::uint32_t;
 
+// The default main port, the one IOServiceGetMatchingService accepts (kIOMasterPortDefault is
+// its older name).
 inline constexpr mach_port_t kIOMasterPortDefault = 0;
 inline constexpr mach_port_t kIOMainPortDefault = 0;
 

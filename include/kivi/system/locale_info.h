@@ -31,31 +31,39 @@
 
 namespace kivi {
 
+// A locale, named by its identifier ("de_DE").
 class KIVI_EXPORT Locale {
  public:
+  // The user's locale: ICU's default locale.
   static std::shared_ptr<const Locale> currentLocale();
   // "de_DE", "en_US_POSIX", "fr".
   static std::shared_ptr<const Locale> localeWithLocaleIdentifier(std::string identifier);
 
+  // The identifier the locale was made with.
   const std::string& localeIdentifier() const { return identifier_; }
   // The region ("DE"), absent when the locale names none.
   std::optional<std::string> countryCode() const;
 
+  // As localeWithLocaleIdentifier: the identifier is kept as given, not checked.
   explicit Locale(std::string identifier) : identifier_(std::move(identifier)) {}
 
  private:
   std::string identifier_;
 };
 
+// A time zone, named by its IANA identifier ("Europe/Berlin").
 class KIVI_EXPORT TimeZone {
  public:
+  // The machine's zone, found afresh as the list above says; "UTC" when nothing names one.
   static std::shared_ptr<const TimeZone> localTimeZone();
   // A zone by its IANA name; null unless the zoneinfo directory holds it
   // ("UTC" and "GMT" always exist).
   static std::shared_ptr<const TimeZone> timeZoneWithName(const std::string& name);
 
+  // The IANA identifier.
   const std::string& name() const { return name_; }
 
+  // A zone of that name, unchecked (timeZoneWithName checks).
   explicit TimeZone(std::string name) : name_(std::move(name)) {}
 
  private:

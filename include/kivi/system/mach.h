@@ -76,19 +76,32 @@
 
 namespace kivi {
 
+// A call's result: KERN_SUCCESS or one of the KERN_ failures.
 using kern_return_t = int;
+// The unsigned and signed 32-bit words the information structures are made of.
 using natural_t = unsigned int;
 using integer_t = int;
+// A name for a task, a thread or the host.
 using mach_port_t = natural_t;
+// The calling process: its process id (mach_task_self()).
 using task_t = mach_port_t;
+// A thread of the calling process: its Linux thread id.
 using thread_act_t = mach_port_t;
+// This machine (mach_host_self()).
 using host_t = mach_port_t;
+// A size in natural_t words: what an information call's *count holds.
 using mach_msg_type_number_t = natural_t;
+// A size in bytes and an address, as wide as a pointer.
 using vm_size_t = std::uintptr_t;
 using vm_address_t = std::uintptr_t;
+// A size in bytes, 64 bits wide everywhere.
 using mach_vm_size_t = std::uint64_t;
+// A scheduling policy: POLICY_TIMESHARE, POLICY_RR or POLICY_FIFO.
 using policy_t = int;
 
+// What the calls answer: KERN_SUCCESS; KERN_INVALID_ADDRESS, a list vm_deallocate did not
+// hand out; KERN_INVALID_ARGUMENT, an argument refused (see above); KERN_FAILURE, facts that
+// could not be read; KERN_RESOURCE_SHORTAGE, memory ran out. KERN_NO_SPACE is never answered.
 inline constexpr kern_return_t KERN_SUCCESS = 0, KERN_INVALID_ADDRESS = 1, KERN_NO_SPACE = 3,
                                KERN_INVALID_ARGUMENT = 4, KERN_FAILURE = 5,
                                KERN_RESOURCE_SHORTAGE = 6;
@@ -101,16 +114,21 @@ KIVI_EXPORT task_t mach_task_self();
 // This machine.
 KIVI_EXPORT host_t mach_host_self();
 
+// A duration: whole seconds and the microseconds after them.
 struct KIVI_EXPORT time_value_t {
-  integer_t seconds;
-  integer_t microseconds;
+  integer_t seconds;       // whole seconds
+  integer_t microseconds;  // 0…999999
 };
 
+// A kind of task information: TASK_BASIC_INFO_64 or TASK_VM_INFO.
 using task_flavor_t = natural_t;
+// The structure task_info fills, seen as words.
 using task_info_t = integer_t*;
 #if defined(__aarch64__)
+// task_info's flavor for task_basic_info_64_data_t (its number differs between architectures).
 inline constexpr task_flavor_t TASK_BASIC_INFO_64 = 18;
 #else
+// task_info's flavor for task_basic_info_64_data_t (its number differs between architectures).
 inline constexpr task_flavor_t TASK_BASIC_INFO_64 = 5;
 #endif
 
@@ -119,88 +137,120 @@ inline constexpr task_flavor_t TASK_BASIC_INFO_64 = 5;
 // then misaligned: copy them out (std::uint64_t size = info.virtual_size)
 // rather than bind a reference or pointer to them.
 #pragma pack(push, 4)
+// The calling process's sizes, times and policy (task_info's TASK_BASIC_INFO_64).
 struct KIVI_EXPORT task_basic_info_64_data_t {
-  integer_t suspend_count;
+  integer_t suspend_count;       // always 0
   mach_vm_size_t virtual_size;   // bytes
   mach_vm_size_t resident_size;  // bytes
   time_value_t user_time;        // of all threads, live and ended
-  time_value_t system_time;
-  policy_t policy;
+  time_value_t system_time;      // spent in the kernel, of all threads
+  policy_t policy;               // the main thread's
 };
 
+// The calling process's memory (task_info's TASK_VM_INFO); sizes in bytes.
 struct KIVI_EXPORT task_vm_info_data_t {
-  mach_vm_size_t virtual_size;
-  integer_t region_count;
-  integer_t page_size;
-  mach_vm_size_t resident_size;
-  mach_vm_size_t resident_size_peak;
-  mach_vm_size_t device;
-  mach_vm_size_t device_peak;
-  mach_vm_size_t internal;
-  mach_vm_size_t internal_peak;
-  mach_vm_size_t external;
-  mach_vm_size_t external_peak;
-  mach_vm_size_t reusable;
-  mach_vm_size_t reusable_peak;
-  mach_vm_size_t purgeable_volatile_pmap;
-  mach_vm_size_t purgeable_volatile_resident;
-  mach_vm_size_t purgeable_volatile_virtual;
-  mach_vm_size_t compressed;
-  mach_vm_size_t compressed_peak;
-  mach_vm_size_t compressed_lifetime;
-  mach_vm_size_t phys_footprint;
-  integer_t reserved[55];  // room the platform's later fields take; zero
+  mach_vm_size_t virtual_size;                 // address space mapped (VmSize)
+  integer_t region_count;                      // always 0
+  integer_t page_size;                         // bytes in a page
+  mach_vm_size_t resident_size;                // in RAM now (VmRSS)
+  mach_vm_size_t resident_size_peak;           // the most ever in RAM (VmHWM)
+  mach_vm_size_t device;                       // always 0
+  mach_vm_size_t device_peak;                  // always 0
+  mach_vm_size_t internal;                     // anonymous memory in RAM (RssAnon)
+  mach_vm_size_t internal_peak;                // always 0
+  mach_vm_size_t external;                     // always 0
+  mach_vm_size_t external_peak;                // always 0
+  mach_vm_size_t reusable;                     // always 0
+  mach_vm_size_t reusable_peak;                // always 0
+  mach_vm_size_t purgeable_volatile_pmap;      // always 0
+  mach_vm_size_t purgeable_volatile_resident;  // always 0
+  mach_vm_size_t purgeable_volatile_virtual;   // always 0
+  mach_vm_size_t compressed;                   // swapped out (VmSwap)
+  mach_vm_size_t compressed_peak;              // always 0
+  mach_vm_size_t compressed_lifetime;          // always 0
+  mach_vm_size_t phys_footprint;               // the process's own: internal + compressed
+  integer_t reserved[55];                      // room the platform's later fields take; zero
 };
 #pragma pack(pop)
 
+// The size of task_basic_info_64_data_t in words: the *count task_info needs for it.
 inline constexpr mach_msg_type_number_t TASK_BASIC_INFO_64_COUNT =
     sizeof(task_basic_info_64_data_t) / sizeof(natural_t);
+// task_info's flavor for task_vm_info_data_t.
 inline constexpr task_flavor_t TASK_VM_INFO = 22;
+// The size of task_vm_info_data_t in words: the *count task_info needs for it.
 inline constexpr mach_msg_type_number_t TASK_VM_INFO_COUNT = 93;
 static_assert(TASK_BASIC_INFO_64_COUNT == 10);
 static_assert(sizeof(task_vm_info_data_t) == TASK_VM_INFO_COUNT * sizeof(natural_t));
 
+// Fills `info`, which has room for *count words, with the flavor's structure about the calling
+// process; `task` must be mach_task_self().
 KIVI_EXPORT kern_return_t task_info(task_t task, task_flavor_t flavor, task_info_t info,
                                     mach_msg_type_number_t* count);
 
+// A list of thread ids that task_threads hands out.
 using thread_act_array_t = thread_act_t*;
+// The calling process's thread ids, ascending, in a new list of *count ids; free it with
+// vm_deallocate.
 KIVI_EXPORT kern_return_t task_threads(task_t task, thread_act_array_t* threads,
                                        mach_msg_type_number_t* count);
+// Frees a list task_threads handed out, given its address and size in bytes exactly.
 KIVI_EXPORT kern_return_t vm_deallocate(task_t task, vm_address_t address, vm_size_t size);
 
+// A kind of thread information: THREAD_BASIC_INFO.
 using thread_flavor_t = natural_t;
+// The structure thread_info fills, seen as words.
 using thread_info_t = integer_t*;
+// thread_info's flavor for thread_basic_info_data_t.
 inline constexpr thread_flavor_t THREAD_BASIC_INFO = 3;
+// A thread's times, recent processor use and state (thread_info's THREAD_BASIC_INFO).
 struct KIVI_EXPORT thread_basic_info_data_t {
-  time_value_t user_time;
-  time_value_t system_time;
-  integer_t cpu_usage;  // 0…TH_USAGE_SCALE
-  policy_t policy;
-  integer_t run_state;  // TH_STATE_…
-  integer_t flags;      // TH_FLAGS_…
-  integer_t suspend_count;
-  integer_t sleep_time;
+  time_value_t user_time;    // run in user mode
+  time_value_t system_time;  // run in the kernel
+  integer_t cpu_usage;       // 0…TH_USAGE_SCALE
+  policy_t policy;           // POLICY_…
+  integer_t run_state;       // TH_STATE_…
+  integer_t flags;           // TH_FLAGS_…
+  integer_t suspend_count;   // always 0
+  integer_t sleep_time;      // always 0
 };
+// The size of thread_basic_info_data_t in words: the *count thread_info needs.
 inline constexpr mach_msg_type_number_t THREAD_BASIC_INFO_COUNT = 10;
 static_assert(sizeof(thread_basic_info_data_t) == THREAD_BASIC_INFO_COUNT * sizeof(natural_t));
+// TH_USAGE_SCALE is the cpu_usage of a thread that keeps one processor busy. Flags:
+// TH_FLAGS_IDLE marks a thread of the idle scheduling class; TH_FLAGS_SWAPPED is never set.
 inline constexpr integer_t TH_USAGE_SCALE = 1000, TH_FLAGS_SWAPPED = 1, TH_FLAGS_IDLE = 2;
+// A thread's run_state: TH_STATE_RUNNING (running or runnable), TH_STATE_STOPPED,
+// TH_STATE_WAITING (sleeping), TH_STATE_UNINTERRUPTIBLE (in an uninterruptible wait) or
+// TH_STATE_HALTED (ended).
 inline constexpr integer_t TH_STATE_RUNNING = 1, TH_STATE_STOPPED = 2, TH_STATE_WAITING = 3,
                            TH_STATE_UNINTERRUPTIBLE = 4, TH_STATE_HALTED = 5;
+// Fills `info`, which has room for *count words, with the flavor's structure about the calling
+// process's thread whose Linux thread id is `thread`.
 KIVI_EXPORT kern_return_t thread_info(thread_act_t thread, thread_flavor_t flavor,
                                       thread_info_t info, mach_msg_type_number_t* count);
 
+// The machine's page size in bytes; `host` must be mach_host_self().
 KIVI_EXPORT kern_return_t host_page_size(host_t host, vm_size_t* size);
 
+// A kind of host information: HOST_VM_INFO.
 using host_flavor_t = integer_t;
+// The structure host_statistics fills, seen as words.
 using host_info_t = integer_t*;
+// host_statistics's flavor for vm_statistics_data_t.
 inline constexpr host_flavor_t HOST_VM_INFO = 2;
+// The machine's memory in pages and its paging counts (host_statistics's HOST_VM_INFO).
 struct KIVI_EXPORT vm_statistics_data_t {
+  // Counts as the list above gives them; those Linux has no counterpart for are 0.
   natural_t free_count, active_count, inactive_count, wire_count, zero_fill_count, reactivations,
       pageins, pageouts, faults, cow_faults, lookups, hits, purgeable_count, purges,
       speculative_count;
 };
+// The size of vm_statistics_data_t in words: the *count host_statistics needs.
 inline constexpr mach_msg_type_number_t HOST_VM_INFO_COUNT = 15;
 static_assert(sizeof(vm_statistics_data_t) == HOST_VM_INFO_COUNT * sizeof(natural_t));
+// Fills `info`, which has room for *count words, with the flavor's structure about this
+// machine; `host` must be mach_host_self().
 KIVI_EXPORT kern_return_t host_statistics(host_t host, host_flavor_t flavor, host_info_t info,
                                           mach_msg_type_number_t* count);
 

@@ -22,6 +22,7 @@
 
 namespace kivi {
 
+// Facts about this process and the machine; reached through processInfo().
 class KIVI_EXPORT ProcessInfo {
  public:
   // The one object of the process.
@@ -32,6 +33,7 @@ class KIVI_EXPORT ProcessInfo {
 
   // Bytes of memory installed.
   std::uint64_t physicalMemory() const;
+  // This process's id (getpid()).
   int processIdentifier() const;
   // Processors the machine has, and those online now.
   std::uint64_t processorCount() const;

@@ -55,15 +55,22 @@
 
 namespace kivi {
 
+// The first number of a numeric name: the kernel's facts or the hardware's.
 inline constexpr int CTL_KERN = 1, CTL_HW = 6;
+// Second numbers under CTL_KERN: kern.ostype, kern.osrelease, kern.version, kern.hostname.
 inline constexpr int KERN_OSTYPE = 1, KERN_OSRELEASE = 2, KERN_VERSION = 4, KERN_HOSTNAME = 10;
+// Second numbers under CTL_HW: hw.machine, hw.ncpu, hw.physmem, hw.usermem, hw.pagesize,
+// hw.memsize.
 inline constexpr int HW_MACHINE = 1, HW_NCPU = 3, HW_PHYSMEM = 5, HW_USERMEM = 6, HW_PAGESIZE = 7,
                      HW_MEMSIZE = 24;
 // The most parts a numeric name may have.
 inline constexpr unsigned int CTL_MAXNAME = 12;
 
+// Reads the fact with dotted name `name` ("hw.memsize") into oldp, which holds *oldlenp bytes;
+// 0, or -1 with errno set. newp must be null.
 KIVI_EXPORT int sysctlbyname(const char* name, void* oldp, std::size_t* oldlenp, const void* newp,
                              std::size_t newlen);
+// As sysctlbyname, for the numeric name of `namelen` numbers at `name` ({CTL_HW, HW_MEMSIZE}).
 KIVI_EXPORT int sysctl(const int* name, unsigned int namelen, void* oldp, std::size_t* oldlenp,
                        const void* newp, std::size_t newlen);
 

@@ -27,6 +27,7 @@ namespace kivi::system {
 KIVI_EXPORT std::string root();
 // An empty string or "/" restores the real machine.
 KIVI_EXPORT void setRoot(std::string directory);
+// True while no other root is set: facts come from the real machine.
 KIVI_EXPORT bool isRealRoot();
 // `absolutePath` (starting with "/") under the current root.
 KIVI_EXPORT std::string pathUnderRoot(std::string_view absolutePath);
