@@ -1,7 +1,9 @@
 #include "kivi/device/kiv_device.h"
 
+#include <algorithm>
 #include <cmath>
 #include <cstdlib>
+#include <limits>
 #include <mutex>
 #include <new>
 #include <string_view>
@@ -219,20 +221,27 @@ std::optional<std::uint64_t> freeBytes() {
   return static_cast<std::uint64_t>(statistics.free_count) * pageSize;
 }
 
+// A byte count as a signed figure: counts past the signed range (a corrupt
+// /proc file can claim them) stay at its top instead of turning negative.
+std::int64_t signedBytes(std::uint64_t bytes) {
+  return static_cast<std::int64_t>(
+      std::min<std::uint64_t>(bytes, std::numeric_limits<std::int64_t>::max()));
+}
+
 }  // namespace
 
 std::int64_t KivDevice::processResidentSize() {
   task_vm_info_data_t info{};
-  return readVMInfo(info) ? static_cast<std::int64_t>(info.resident_size) : -1;
+  return readVMInfo(info) ? signedBytes(info.resident_size) : -1;
 }
 
 std::int64_t KivDevice::processPhysicalFootprint() {
   task_vm_info_data_t info{};
-  return readVMInfo(info) ? static_cast<std::int64_t>(info.phys_footprint) : -1;
+  return readVMInfo(info) ? signedBytes(info.phys_footprint) : -1;
 }
 
 std::int64_t KivDevice::physicalMemory() {
-  return static_cast<std::int64_t>(ProcessInfo::processInfo().physicalMemory());
+  return signedBytes(ProcessInfo::processInfo().physicalMemory());
 }
 
 std::int64_t KivDevice::percentCpuUsage() {
@@ -262,7 +271,7 @@ std::int64_t KivDevice::percentCpuUsage() {
 
 std::int64_t KivDevice::processFreeMemory() {
   const auto bytes = freeBytes();
-  return bytes ? static_cast<std::int64_t>(*bytes) : -1;
+  return bytes ? signedBytes(*bytes) : -1;
 }
 
 std::uint64_t KivDevice::totalMemory() {
