@@ -39,6 +39,16 @@ struct Watcher {
     const std::uint64_t one = 1;
     [[maybe_unused]] ssize_t n = ::write(wakeFd, &one, sizeof one);
   }
+  // Stops the thread and waits for it. When called on the watcher thread
+  // itself (the last reference went away inside a handler call), the thread
+  // is detached and ends on its own, keeping the state.
+  void stopAndJoin() {
+    requestStop();
+    if (thread.get_id() == std::this_thread::get_id())
+      thread.detach();
+    else if (thread.joinable())
+      thread.join();
+  }
 };
 
 // The chunk a watcher thread has read, offered to availableData() while its
@@ -227,15 +237,7 @@ NSFileHandle::~NSFileHandle() {
     watcher = std::move(state_->watcher);
     state_->handler = nullptr;
   }
-  if (watcher) {
-    watcher->requestStop();
-    // The last reference may go away inside a handler call, on the watcher
-    // thread itself; the thread then ends on its own, keeping the state.
-    if (watcher->thread.get_id() == std::this_thread::get_id())
-      watcher->thread.detach();
-    else if (watcher->thread.joinable())
-      watcher->thread.join();
-  }
+  if (watcher) watcher->stopAndJoin();
   // Descriptors that are not owned stay open; owned ones close with the
   // state once no operation uses them.
 }
@@ -320,13 +322,7 @@ void NSFileHandle::closeFile() {
     watcher = std::move(state_->watcher);
     state_->handler = nullptr;
   }
-  if (watcher) {
-    watcher->requestStop();
-    if (watcher->thread.get_id() == std::this_thread::get_id())
-      watcher->thread.detach();
-    else if (watcher->thread.joinable())
-      watcher->thread.join();
-  }
+  if (watcher) watcher->stopAndJoin();
   int toClose = -1;
   {
     std::lock_guard lock(state_->mutex);
@@ -369,13 +365,7 @@ void NSFileHandle::setReadabilityHandler(NSFileHandleReadabilityHandler handler)
           std::thread(detail::watch, state_, watcher, std::weak_ptr<NSFileHandle>(self));
     }
   }
-  if (stopped) {
-    stopped->requestStop();
-    if (stopped->thread.get_id() == std::this_thread::get_id())
-      stopped->thread.detach();
-    else if (stopped->thread.joinable())
-      stopped->thread.join();
-  }
+  if (stopped) stopped->stopAndJoin();
 }
 
 }  // namespace kivi
