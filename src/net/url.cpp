@@ -133,24 +133,6 @@ bool pathByteAllowed(unsigned char c) noexcept {
   return std::strchr("-._~/!$&'()*+,;=:@", c) != nullptr && c != '\0';
 }
 
-// Percent-decoding that keeps any bytes; none for a malformed escape.
-std::optional<std::string> decodeBytes(std::string_view text) {
-  std::string out;
-  out.reserve(text.size());
-  for (std::size_t i = 0; i < text.size(); ++i) {
-    if (text[i] != '%') {
-      out += text[i];
-      continue;
-    }
-    if (i + 2 >= text.size() || !isHexDigit(text[i + 1]) || !isHexDigit(text[i + 2]))
-      return std::nullopt;
-    auto hex = [](char c) { return c <= '9' ? c - '0' : (c | 0x20) - 'a' + 10; };
-    out += static_cast<char>(hex(text[i + 1]) * 16 + hex(text[i + 2]));
-    i += 2;
-  }
-  return out;
-}
-
 std::string currentDirectory() {
   std::string buffer(PATH_MAX, '\0');
   if (!::getcwd(buffer.data(), buffer.size())) return "/";
@@ -324,7 +306,7 @@ bool URL::isFileURL() const {
 
 std::optional<std::string> URL::fileSystemRepresentation() const {
   if (!isFileURL()) return std::nullopt;
-  auto bytes = decodeBytes(parts(string_).percentEncodedPath());
+  auto bytes = percent_encoding::decodeBytes(parts(string_).percentEncodedPath());
   if (!bytes || bytes->empty() || bytes->find('\0') != std::string::npos) return std::nullopt;
   return bytes;
 }

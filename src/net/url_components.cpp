@@ -166,6 +166,12 @@ std::string encode(std::string_view text, Component component) {
 }
 
 std::optional<std::string> decode(std::string_view text) {
+  auto out = decodeBytes(text);
+  if (!out || !unicode::isValidUTF8(*out)) return std::nullopt;
+  return out;
+}
+
+std::optional<std::string> decodeBytes(std::string_view text) {
   std::string out;
   out.reserve(text.size());
   for (std::size_t i = 0; i < text.size(); ++i) {
@@ -177,7 +183,6 @@ std::optional<std::string> decode(std::string_view text) {
     out += static_cast<char>(hexValue(text[i + 1]) * 16 + hexValue(text[i + 2]));
     i += 2;
   }
-  if (!unicode::isValidUTF8(out)) return std::nullopt;
   return out;
 }
 

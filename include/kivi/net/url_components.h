@@ -128,6 +128,9 @@ KIVI_EXPORT std::string encode(std::string_view text, Component component);
 // Decodes %XX sequences (either case of hex digit); none when a "%" is not
 // followed by two hex digits or the decoded bytes are not UTF-8.
 KIVI_EXPORT std::optional<std::string> decode(std::string_view text);
+// Decodes %XX sequences as decode() does but keeps any bytes (a file path
+// need not be UTF-8); none only for a malformed escape.
+KIVI_EXPORT std::optional<std::string> decodeBytes(std::string_view text);
 // Whether `text` uses only bytes `component` allows and well-formed %XX.
 KIVI_EXPORT bool isValidlyEncoded(std::string_view text, Component component);
 }  // namespace percent_encoding
